@@ -1,0 +1,25 @@
+#pragma once
+
+#include <opencv2/core.hpp>
+
+namespace vora {
+
+class FeatureNetwork;
+
+constexpr int kNetworkInputSize = 256;
+constexpr int kNetworkImageSize = 227;
+constexpr double kMaxAspectRatio = 1.5;
+
+// Aspect crop, then an area resize into a black input canvas (14 px border at
+// top and left, 15 at bottom and right for 227 in 256). Returns false, after
+// the diagnostic on standard error, when the image is empty.
+bool PrepareNetworkImage(const cv::Mat& image, cv::Mat& output, int cropSize, int inputSize);
+
+// The region PrepareNetworkImage keeps of an image of the given size.
+cv::Rect AspectCropRegion(int rows, int cols);
+
+// Runs the network once and copies the first 512 output floats into feature.
+// Returns false when the image is empty (the feature is left as it was).
+bool ExtractFeature(FeatureNetwork& network, const cv::Mat& bgr8, float* feature);
+
+}  // namespace vora

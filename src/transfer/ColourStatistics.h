@@ -1,0 +1,34 @@
+#pragma once
+
+#include <opencv2/core.hpp>
+
+namespace vora {
+
+// Summary of an image's colour, 40 floats. Database styles store entries
+// 0..37 and leave the two percentile points at zero.
+struct ColourStats {
+    float chromaMean[2];     // mean a*, b*
+    float chromaSqrtCov[4];  // symmetric square root of the chroma covariance, row-major
+    float lightness[32];     // normalised lightness samples, ascending, in [0, 1]
+    float lightnessLow;      // L*/100 at the 0.5 % point
+    float lightnessHigh;     // L*/100 at the 99.5 % point
+
+    const float* data() const { return chromaMean; }
+    float* data() { return chromaMean; }
+};
+static_assert(sizeof(ColourStats) == 40 * sizeof(float), "ColourStats is 40 packed floats");
+
+// bgr8: CV_8UC3 in B, G, R order; lab: CV_32FC3 of the same size, allocated by
+// the caller, receives (L*/100, a*, b*). Nothing happens for zero rows.
+void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab);
+
+// Entries 0..5. The image must hold at least one pixel. Returns 0.
+int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
+
+// Entries 6..39. The image must hold at least one pixel. Returns 0.
+int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats);
+
+// Symmetric square root of a 2x2 CV_32F matrix by SVD: u * diag(sqrt(w)) * vt.
+void MatrixSqrt(const cv::Mat& input, cv::Mat& output);
+
+}  // namespace vora
