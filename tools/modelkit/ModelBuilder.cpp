@@ -134,10 +134,37 @@ cv::Mat PooledRow(FeatureNetwork& network, const cv::Mat& bgr8) {
     return cv::Mat(pooled, true).reshape(1, 1);
 }
 
-float EuclideanDistance(const float* a, const float* b, int size) {
+double EuclideanDistance(const float* a, const float* b, int size) {
     double sum = 0.0;
     for (int i = 0; i < size; ++i) sum += (double(a[i]) - b[i]) * (double(a[i]) - b[i]);
-    return static_cast<float>(std::sqrt(sum));
+    return std::sqrt(sum);
+}
+
+// Score of style s for cluster k: how much nearer the cluster centre is to
+// the style photo's own descriptor than the average centre is,
+//   score = mean_j |c_j - f_s| - |c_k - f_s|,
+// so styles taken from scenes like the cluster's rank first. Subtracting the
+// plain distance alone would let a few styles that sit near the middle of
+// the descriptor space ("hubs") head every cluster's ranking.
+std::vector<float> ClusterStyleScores(const cv::Mat& centres, const cv::Mat& styleFeatures) {
+    const int clusters = centres.rows;
+    const int styles = styleFeatures.rows;
+    std::vector<double> distance(static_cast<size_t>(clusters) * styles);
+    std::vector<double> mean(styles, 0.0);
+    for (int k = 0; k < clusters; ++k) {
+        for (int s = 0; s < styles; ++s) {
+            const double d = EuclideanDistance(centres.ptr<float>(k), styleFeatures.ptr<float>(s), centres.cols);
+            distance[static_cast<size_t>(k) * styles + s] = d;
+            mean[s] += d / clusters;
+        }
+    }
+    std::vector<float> scores(distance.size());
+    for (int k = 0; k < clusters; ++k)
+        for (int s = 0; s < styles; ++s) {
+            const size_t i = static_cast<size_t>(k) * styles + s;
+            scores[i] = static_cast<float>(mean[s] - distance[i]);
+        }
+    return scores;
 }
 
 }  // namespace
@@ -241,18 +268,11 @@ void BuildModel(const BuildModelOptions& options) {
         file.Close();
     }
     {
-        // Score: minus the distance from the cluster centre to the style
-        // photo's own descriptor, so styles taken from scenes like the
-        // cluster's rank first.
         BinaryFile file(stage / kScoresFileName);
         file.Int(clusters);
         file.Int(styleCount);
-        std::vector<float> row(styleCount);
-        for (int k = 0; k < clusters; ++k) {
-            for (int s = 0; s < styleCount; ++s)
-                row[s] = -EuclideanDistance(centres.ptr<float>(k), styleFeatures.ptr<float>(s), kDescriptorSize);
-            file.Floats(row.data(), row.size());
-        }
+        const std::vector<float> scores = ClusterStyleScores(centres, styleFeatures);
+        file.Floats(scores.data(), scores.size());
         file.Close();
     }
     {
