@@ -131,6 +131,13 @@ layer { name: "sink" type: "Eltwise" bottom: "out" bottom: "other" top: "sum" })
     EXPECT_EQ(commented.inputName, "data");
     EXPECT_EQ(prototext::Parse(commented.text).All("layer").size(), 3u);
 
+    // The old layer format names the type by its enum.
+    const PreparedDefinition old = PrepareDefinition(R"(
+layers { name: "d" type: MEMORY_DATA top: "data" top: "label" memory_data_param { channels: 3 height: 4 width: 4 } }
+layers { name: "fc" type: INNER_PRODUCT bottom: "data" top: "fc" })");
+    EXPECT_TRUE(old.memoryData);
+    EXPECT_EQ(old.outputTop, "fc");
+
     // Layers a testing network leaves out do not count as the first layer.
     const PreparedDefinition phased = PrepareDefinition(std::string(R"(
 layer { name: "train" type: "Data" top: "data" top: "label" include { phase: TRAIN } })") + kMemoryDataLayer + R"(

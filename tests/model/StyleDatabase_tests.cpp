@@ -79,13 +79,11 @@ TEST(StyleDatabase, OddColumnCountKeepsTheBetterHalfRoundedDown) {
     ASSERT_EQ(engine.rankedStyles.size(), 2u);
     EXPECT_EQ(engine.rankedStyles[0], (std::vector<int32_t>{1, 3, -1, -1, -1}));
     EXPECT_EQ(engine.rankedStyles[1], (std::vector<int32_t>{3, 0, -1, -1, -1}));
-}
 
-TEST(StyleDatabase, OneStyleColumnKeepsNoStyle) {
-    const ModelFixture model(DataOnly(2, 1));
-    Engine engine;
-    ASSERT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-    EXPECT_EQ(engine.rankedStyles, (std::vector<std::vector<int32_t>>{{-1}, {-1}}));
+    const ModelFixture oneColumn(DataOnly(2, 1));
+    Engine oneColumnEngine;
+    ASSERT_EQ(ReadDatabase(oneColumnEngine, oneColumn.modelDir()), ReadResult::Ok);
+    EXPECT_EQ(oneColumnEngine.rankedStyles, (std::vector<std::vector<int32_t>>{{-1}, {-1}}));
 }
 
 TEST(StyleDatabase, TransposedScoresAreRejectedUnlessSquare) {
