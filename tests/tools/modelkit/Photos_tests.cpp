@@ -1,7 +1,6 @@
 #include "modelkit/Photos.h"
 
 #include <gtest/gtest.h>
-#include <opencv2/imgcodecs.hpp>
 
 using namespace vora::modelkit;
 
@@ -27,11 +26,6 @@ TEST(Photos, AlterationsChangeWhatTheySay) {
 
     EXPECT_EQ(Alter(photo, Alteration::HalfSize).size(), cv::Size(125, 51));
 
-    const cv::Mat jpeg = Alter(photo, Alteration::Jpeg60);
-    EXPECT_EQ(jpeg.size(), photo.size());
-    EXPECT_GT(cv::norm(jpeg, photo, cv::NORM_L1), 0.0);
-
     EXPECT_EQ(Alter(photo, Alteration::Brighter10).at<cv::Vec3b>(0, 0), cv::Vec3b(255, 110, 11));
     EXPECT_EQ(Alter(photo, Alteration::Darker10).at<cv::Vec3b>(0, 0), cv::Vec3b(216, 90, 9));
-    EXPECT_EQ(AllAlterations().size(), 5u);
 }
