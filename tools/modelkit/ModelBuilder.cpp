@@ -172,7 +172,7 @@ std::vector<float> ClusterStyleScores(const cv::Mat& centres, const cv::Mat& sty
 void BuildModel(const BuildModelOptions& options) {
     if (options.stylesDir.empty()) throw std::runtime_error("no style photo folder given");
     if (options.outDir.empty()) throw std::runtime_error("no model folder given");
-    if (options.clusters < 0) throw std::runtime_error("the number of clusters must be positive");
+    if (options.clusters < 0) throw std::runtime_error("the number of clusters cannot be negative");
 
     Report(options, 0.0, "listing photos");
     const std::vector<std::string> stylePaths = ListPhotos(options.stylesDir);
@@ -184,6 +184,18 @@ void BuildModel(const BuildModelOptions& options) {
     if (!options.contentDir.empty()) {
         contentPaths = ListPhotos(options.contentDir);
         if (contentPaths.empty()) throw std::runtime_error("no photos in " + options.contentDir);
+    }
+    // Each style photo gives itself and its altered copies, unless content
+    // photos are given.
+    const int samples = contentPaths.empty() ? static_cast<int>(stylePaths.size() * (1 + AllAlterations().size()))
+                                             : static_cast<int>(contentPaths.size());
+    int clusters = options.clusters;
+    if (clusters == 0) {
+        clusters = std::min({kMaxDefaultClusters, samples,
+                             std::max(1, static_cast<int>(std::lround(double(samples) / kSamplesPerCluster)))});
+    } else if (clusters > samples) {
+        throw std::runtime_error("cannot make " + std::to_string(clusters) + " clusters from " + std::to_string(samples) +
+                                 " content samples; ask for at most " + std::to_string(samples));
     }
 
     Staging staging(options.outDir);
@@ -231,15 +243,6 @@ void BuildModel(const BuildModelOptions& options) {
     const cv::Mat contentFeatures = describe(contentPooled);
 
     // Semantic clusters of the content samples.
-    const int samples = contentFeatures.rows;
-    int clusters = options.clusters;
-    if (clusters == 0) {
-        clusters = std::min({kMaxDefaultClusters, samples,
-                             std::max(1, static_cast<int>(std::lround(double(samples) / kSamplesPerCluster)))});
-    } else if (clusters > samples) {
-        throw std::runtime_error("cannot make " + std::to_string(clusters) + " clusters from " + std::to_string(samples) +
-                                 " content samples; ask for at most " + std::to_string(samples));
-    }
     Report(options, 0.85, "clustering " + std::to_string(samples) + " samples into " + std::to_string(clusters));
     cv::Mat labels, centres;
     {
