@@ -212,8 +212,9 @@ protected:
         std::vector<TRANSFER> out(n + 1);
         for (TRANSFER& t : out) t.styleIndex = 777;
         const Status status = api.compute_transfers(content.get(), out, params);
-        if (status != STATUS_OK)
+        if (status != STATUS_OK) {
             for (const TRANSFER& t : out) EXPECT_EQ(t.styleIndex, 777);
+        }
         if (keep) *keep = out;
         return status;
     }
