@@ -82,14 +82,16 @@ namespace vora {
 /// Result of every facade operation.
 enum Status : int32_t {
     STATUS_OK = 0,
-    /// A required pointer is null, an image has no pixels to read (zero width
-    /// or height), source and destination of apply differ in geometry, or the
-    /// vector given to compute_transfers holds fewer than numTransfers records.
+    /// A required pointer is null (facade, image object, record array,
+    /// parameters), source and destination of apply differ in geometry or have
+    /// fewer than three bytes a pixel, or the vector given to compute_transfers
+    /// holds fewer than numTransfers records.
     STATUS_INVALID_ARGUMENT = 1,
     /// numTransfers is 0: style selection needs room for at least one choice.
     STATUS_NO_TRANSFERS_REQUESTED = 2,
     /// The model's tables are empty or do not agree with each other (a data
-    /// file was missing or rejected at load time), so styles cannot be ranked.
+    /// file was missing or rejected at load time), or its network gives fewer
+    /// than 512 values, so styles cannot be ranked.
     STATUS_MODEL_INCOMPLETE = 3,
     /// The nearest cluster's ranking holds no valid style, so the selection
     /// could never finish.

@@ -26,6 +26,9 @@ void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab);
 int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
 
 // Entries 6..39. The image must hold at least one pixel. Returns 0.
+// A flat image (or a single pixel) normalises every value to 0, and the
+// sample index of its first entry would fall one past the end; sample indices
+// are clamped into the sorted array, so such an image samples its end values.
 int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats);
 
 // Symmetric square root of a 2x2 CV_32F matrix by SVD: u * diag(sqrt(w)) * vt.
