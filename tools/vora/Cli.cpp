@@ -1,6 +1,8 @@
 #include "vora/Cli.h"
 
+#include <cctype>
 #include <cerrno>
+#include <cstdio>
 #include <cmath>
 #include <cstdlib>
 #include <iostream>
@@ -126,9 +128,25 @@ std::vector<Command>& CommandRegistry() {
 
 RegisterCommand::RegisterCommand(Command command) { CommandRegistry().push_back(std::move(command)); }
 
-void PrintError(const std::string& line) { std::cerr << "vora: " << line << std::endl; }
+namespace {
 
-void PrintNotice(const std::string& line) { std::cerr << "vora: " << line << std::endl; }
+// Messages from dependencies may span lines; ours are one line each.
+std::string OneLine(const std::string& text) {
+    std::string line;
+    for (char c : text) {
+        if (c == '\n' || c == '\r' || c == '\t') c = ' ';
+        if (c == ' ' && !line.empty() && line.back() == ' ') continue;
+        line += c;
+    }
+    while (!line.empty() && line.back() == ' ') line.pop_back();
+    return line;
+}
+
+}  // namespace
+
+void PrintError(const std::string& line) { std::cerr << "vora: " << OneLine(line) << std::endl; }
+
+void PrintNotice(const std::string& line) { std::cerr << "vora: " << OneLine(line) << std::endl; }
 
 }  // namespace cli
 }  // namespace vora

@@ -91,11 +91,17 @@ std::string CheckNetwork(ModelExamination& model) {
         model.problems.push_back(std::string("the network fails on a test picture: ") + e.what());
         return "network: loads, but fails on a test picture";
     }
+    if (status == STATUS_MODEL_INCOMPLETE) {
+        // The data files were found complete and in agreement above, so the
+        // library's "incomplete" can only mean a short feature.
+        model.problems.push_back("the network does not give the 512 values the library needs");
+        return "network: loads, but its feature is too short";
+    }
     if (status != STATUS_OK) {
         model.problems.push_back("a test computation fails: " + StatusText(status));
         return "network: loads, but a test computation fails";
     }
-    return "network: loads and gives a feature; a test picture was matched to cluster " +
+    return "network: loads and gives 512 values; a test picture was matched to cluster " +
            std::to_string(out[0].clusterIndex) + " and given style " + std::to_string(out[0].styleIndex);
 }
 

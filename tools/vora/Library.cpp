@@ -31,10 +31,14 @@ std::string AbsoluteModelPath(const std::string& dir) {
     return path;
 }
 
-std::unique_ptr<vora_api> OpenModel(const std::string& dir) {
+void RequireModelDirectory(const std::string& dir) {
     std::error_code ec;
     if (!std::filesystem::exists(dir, ec)) throw Failure(dir, "no such model directory");
     if (!std::filesystem::is_directory(dir, ec)) throw Failure(dir, "is not a directory (a model is a folder)");
+}
+
+std::unique_ptr<vora_api> OpenModel(const std::string& dir) {
+    RequireModelDirectory(dir);
     try {
         return std::make_unique<vora_api>(WithTrailingSlash(dir));
     } catch (const cv::Exception& e) {

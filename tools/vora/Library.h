@@ -25,6 +25,9 @@ std::string WithTrailingSlash(const std::string& dir);
 // as recorded in transfers files.
 std::string AbsoluteModelPath(const std::string& dir);
 
+// Failure unless dir is an existing folder.
+void RequireModelDirectory(const std::string& dir);
+
 // Constructs the facade on dir. Failure when the folder is missing or the
 // network does not load (the library reports that by the network loader's
 // exception, which is turned into one line here).

@@ -43,7 +43,7 @@ int main(int argc, char** argv) {
 
     std::vector<std::string> args(argv + 1, argv + argc);
     if (args.empty()) {
-        PrintOverview(std::cerr);
+        vora::cli::PrintError("no command given (see vora --help)");
         return vora::cli::kExitUsage;
     }
     const std::string name = args.front();

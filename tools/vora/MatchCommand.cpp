@@ -15,9 +15,7 @@ namespace vora {
 namespace cli {
 namespace {
 
-const char* const kSynopsis =
-    "match CONTENT STYLE OUT [--model DIR] [--solve F] [--limit F] [--json FILE] [--force]\n"
-    "       vora match CONTENT --style-index N OUT [...]";
+const char* const kSynopsis = "match CONTENT (STYLE | --style-index N) OUT [options]";
 
 const char* const kHelp =
     "usage: vora match CONTENT STYLE OUT [options]\n"

@@ -24,9 +24,7 @@ namespace fs = std::filesystem;
 constexpr long long kMaxProposals = 100;
 constexpr int kThumbnailSide = 420;
 
-const char* const kSynopsis =
-    "suggest PHOTO [-n N] [--model DIR] [--faces auto|none|L,R,T,B ...] [--out DIR] [--format EXT]\n"
-    "       [--ranking F] [--solve F] [--limit F] [--finish F] [--detector hog|haar] [--force]";
+const char* const kSynopsis = "suggest PHOTO [options]";
 
 const char* const kHelp =
     "usage: vora suggest PHOTO [options]\n"
@@ -120,6 +118,7 @@ int Run(const std::vector<std::string>& args) {
     // The model: its files are examined first, because the library loads
     // silently and would only say "incomplete" later.
     const std::string modelDir = ChooseModelDir(parsed.Value("--model").value_or(""));
+    RequireModelDirectory(modelDir);
     const ModelExamination model = ExamineModelFiles(modelDir);
     if (model.broken())
         throw Failure(modelDir, "the model is broken: " + model.problems.front() + " (run 'vora inspect " + modelDir +
