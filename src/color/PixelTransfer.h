@@ -30,4 +30,19 @@ inline float NormaliseLightness(float lightness01, float low, float high) {
     return t < 1.0f ? t : 1.0f;
 }
 
+// The chroma map of a transfer: (a, b) relative to the content mean, through
+// the row-major 2x2 matrix, about the style mean. All in float.
+struct ChromaPixel {
+    float a;
+    float b;
+};
+
+inline ChromaPixel MapChroma(const float* contentMean, const float* chromaMatrix, const float* styleMean,
+                             float a, float b) {
+    const float d0 = a - contentMean[0];
+    const float d1 = b - contentMean[1];
+    return ChromaPixel{chromaMatrix[0] * d0 + chromaMatrix[1] * d1 + styleMean[0],
+                       chromaMatrix[2] * d0 + chromaMatrix[3] * d1 + styleMean[1]};
+}
+
 }  // namespace vora

@@ -38,6 +38,18 @@ void PutBytes(std::string& out, int field, const std::string& bytes) {
     out += bytes;
 }
 
+std::string SerializeLayer(const WeightsLayer& layer) {
+    std::string out;
+    PutBytes(out, kLayerName, layer.name);
+    PutBytes(out, kLayerType, layer.type);
+    for (const std::string& bottom : layer.bottoms) PutBytes(out, kLayerBottom, bottom);
+    for (const std::string& top : layer.tops) PutBytes(out, kLayerTop, top);
+    for (const WeightsBlob& blob : layer.blobs) PutBytes(out, kLayerBlobs, SerializeBlob(blob));
+    return out;
+}
+
+}  // namespace
+
 std::string SerializeBlob(const WeightsBlob& blob) {
     std::string shape;
     std::string dims;
@@ -53,18 +65,6 @@ std::string SerializeBlob(const WeightsBlob& blob) {
     PutBytes(out, kBlobShape, shape);
     return out;
 }
-
-std::string SerializeLayer(const WeightsLayer& layer) {
-    std::string out;
-    PutBytes(out, kLayerName, layer.name);
-    PutBytes(out, kLayerType, layer.type);
-    for (const std::string& bottom : layer.bottoms) PutBytes(out, kLayerBottom, bottom);
-    for (const std::string& top : layer.tops) PutBytes(out, kLayerTop, top);
-    for (const WeightsBlob& blob : layer.blobs) PutBytes(out, kLayerBlobs, SerializeBlob(blob));
-    return out;
-}
-
-}  // namespace
 
 std::string SerializeWeights(const std::string& netName, const std::vector<WeightsLayer>& layers) {
     std::string out;

@@ -22,6 +22,9 @@ struct WeightsLayer {
     std::vector<WeightsBlob> blobs;
 };
 
+// Serialises one BlobProto (shape and packed data), the layout of a mean file.
+std::string SerializeBlob(const WeightsBlob& blob);
+
 // Serialises a NetParameter holding the named layers and their blobs.
 std::string SerializeWeights(const std::string& netName, const std::vector<WeightsLayer>& layers);
 

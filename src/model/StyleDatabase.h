@@ -13,11 +13,29 @@ extern const char* const kStyleFileName;     // "styledb_style_1500.dat"
 extern const char* const kScoresFileName;    // "semantic_style_scores_1000_1500_1.dat"
 extern const char* const kDistanceFileName;  // "styledb_fdist_1500.dat"
 
-// Data files are joined as modelDir + "/" + name.
+// Data files are joined as modelDir + "/" + name (so "./model/" gives
+// "./model//name", which file systems accept).
 std::string DataFilePath(const std::string& modelDir, const char* name);
 
+// The readers take every count from the file's own header. Tables are
+// zero-filled before reading and reads are not checked, so a file shorter than
+// its header promises leaves a zero tail without an error. A negative count in
+// the cluster or style file is read as 0 (empty table, count 0).
+
+// Cluster centres and count. A missing file leaves both untouched.
 void ReadClusterCentres(Engine& engine, const std::string& modelDir);
+
+// Style records and count from the file at path; CannotOpen leaves both untouched.
 ReadResult ReadStyleRecords(Engine& engine, const std::string& path);
+
+// Scores, then distances; needs the cluster and style counts already read.
+// The score column count is stored even when the file is then rejected.
+// SizeMismatch when the score rows differ from the cluster count or the
+// columns from the style count (also when the counts are negative or their
+// product leaves the int32 range: nothing else is stored, the distances are
+// not read), or when the distance count differs from the style count (the
+// ranking stays, the distance table is untouched). Each cluster keeps the
+// better half of its styles, C / 2, by decreasing score; the rest hold -1.
 ReadResult ReadScoresAndDistances(Engine& engine, const std::string& modelDir);
 
 }  // namespace vora

@@ -1,0 +1,184 @@
+// Applying a transfer to a whole image or a tile: geometry and face boxes are
+// prepared once, then a plain per-pixel kernel runs over bands of whole rows.
+#include "color/ApplyTransfer.h"
+
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+
+#include <tbb/blocked_range2d.h>
+#include <tbb/parallel_for.h>
+#include <tbb/partitioner.h>
+#include <tbb/task_group.h>
+
+#include "color/ColorConversion.h"
+#include "color/PixelTransfer.h"
+
+namespace vora {
+namespace {
+
+// The one diagnostic of apply, printed once per tiled image (by its origin tile).
+constexpr char kCorrectFacesMessage[] = "Correct %d faces!!\n";
+
+// A position in the full image, normalised to 0..1: the tile origin plus the
+// pixel index, each sum converted to float and divided in float.
+inline float FullImagePosition(size_t tileOrigin, size_t index, size_t fullExtent) {
+    return static_cast<float>(tileOrigin + index) / static_cast<float>(fullExtent);
+}
+
+// Lifts the lightness of a pixel inside face boxes. Every face starts from the
+// same base and overlapping faces combine by maximum, so face order does not
+// matter. Box edges are outside (strict comparisons, in double).
+inline float LiftFaces(const FaceBox* boxes, const FaceCorrection* faces, size_t faceCount, float px, float py,
+                       float base, float a, float b) {
+    float lifted = base;
+    for (size_t i = 0; i < faceCount; ++i) {
+        const FaceBox& box = boxes[i];
+        if (px > box.xLow && px < box.xHigh && py > box.yLow && py < box.yHigh) {
+            const FaceCorrection& face = faces[i];
+            const float dx = (px - face.centreX) / face.halfSizeX;
+            const float dy = (py - face.centreY) / face.halfSizeY;
+            const float da = face.measuredA - a;
+            const float db = face.measuredB - b;
+            const float weight = expf((da * da + db * db) / -1000.0f - (dx * dx + dy * dy) / 2.2f);
+            const float candidate = powf(base, face.exponent) * weight + (1.0f - weight) * base;
+            lifted = std::max(candidate, lifted);
+        }
+    }
+    return lifted;
+}
+
+// The kernel; the face variant is chosen once per band, not per pixel.
+template <bool kWithFaces>
+void RunBand(const ApplyTransferWorker& worker, size_t rowBegin, size_t rowEnd, size_t columnBegin,
+             size_t columnEnd) {
+    const TRANSFER& transfer = worker.transfer;
+    const float low = transfer.lightnessLow;
+    const float high = transfer.lightnessHigh;
+    const FaceCorrection* faces = transfer.faceCorrections.data();
+    const size_t faceCount = std::min(worker.faceCount, transfer.faceCorrections.size());
+    const size_t pixelStride = worker.pixelStride;
+
+    for (size_t r = rowBegin; r < rowEnd; ++r) {
+        const size_t offset = r * worker.rowStride + columnBegin * pixelStride;
+        const uint8_t* in = worker.source + offset;
+        uint8_t* out = worker.destination + offset;
+        float py = 0.0f;
+        if constexpr (kWithFaces) py = FullImagePosition(worker.tileTop, r, worker.fullHeight);
+        for (size_t c = columnBegin; c < columnEnd; ++c, in += pixelStride, out += pixelStride) {
+            // All three source bytes are read before any destination byte is
+            // written, so source and destination may be the same memory.
+            const LabPixel lab = RgbToLab(in[0], in[1], in[2]);
+            float lightness = ToneCurveLookup(transfer.toneCurve, NormaliseLightness(lab.lightness01, low, high));
+            const ChromaPixel chroma =
+                MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
+            if constexpr (kWithFaces) {
+                const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
+                lightness = LiftFaces(worker.faceBoxes, faces, faceCount, px, py, lightness, chroma.a, chroma.b);
+            }
+            const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
+            out[0] = rgb.red;
+            out[1] = rgb.green;
+            out[2] = rgb.blue;
+            // Bytes from 3 on (alpha, padding) are left as they are.
+        }
+    }
+}
+
+enum class Threading { Parallel, Serial };
+
+// Input outside the contract that the kernel would turn into out-of-bounds
+// reads or writes. Only called for a non-empty source.
+bool GeometryIsUsable(const IImage& source, const IImage& destination) {
+    if (source.GetConstData() == nullptr || destination.GetConstData() == nullptr) return false;
+    // The destination is addressed with the source's strides: they must agree.
+    if (destination.GetWidth() != source.GetWidth() || destination.GetHeight() != source.GetHeight() ||
+        destination.GetRowStride() != source.GetRowStride() ||
+        destination.GetPixelStride() != source.GetPixelStride()) {
+        return false;
+    }
+    // Three colour bytes per pixel, and rows that do not overlap.
+    const size_t pixelStride = source.GetPixelStride();
+    if (pixelStride < 3) return false;
+    return source.GetWidth() <= source.GetRowStride() / pixelStride;
+}
+
+Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, Threading threading) {
+    if (source == nullptr || destination == nullptr) return STATUS_INVALID_ARGUMENT;
+
+    const size_t rows = source->GetHeight();
+    const size_t columns = source->GetWidth();
+    const bool empty = rows == 0 || columns == 0;
+    // An empty source is inside the contract: nothing is read or written.
+    if (!empty && !GeometryIsUsable(*source, *destination)) return STATUS_INVALID_ARGUMENT;
+
+    const CTopLeftCoordinate topLeft = source->GetTopLeft();
+    const CFullResImageSize fullResSize = source->GetFullResSize();
+    const std::vector<FaceBox> faceBoxes = MakeFaceBoxes(transfer);
+
+    // Only the tile at the origin reports, so a tiled image prints the line once.
+    const int faceCount = static_cast<int>(transfer.faceCorrections.size());
+    if (topLeft.left == 0 && topLeft.top == 0 && faceCount >= 1) std::printf(kCorrectFacesMessage, faceCount);
+
+    if (empty) return STATUS_OK;
+
+    const ApplyTransferWorker worker{rows,
+                                     columns,
+                                     source->GetRowStride(),
+                                     source->GetPixelStride(),
+                                     source->GetConstData(),
+                                     transfer,
+                                     destination->GetData(),
+                                     topLeft.left,
+                                     topLeft.top,
+                                     fullResSize.width,
+                                     fullResSize.height,
+                                     faceBoxes.size(),
+                                     faceBoxes.data()};
+
+    if (threading == Threading::Serial) {
+        worker.Run(0, rows, 0, columns);
+    } else {
+        // Column grain = width: a range is never split across columns, so every
+        // task gets a band of whole rows.
+        tbb::task_group_context context;
+        tbb::parallel_for(tbb::blocked_range2d<size_t, size_t>(0, rows, 1, 0, columns, columns), worker,
+                          tbb::auto_partitioner(), context);
+    }
+    return STATUS_OK;
+}
+
+}  // namespace
+
+std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer) {
+    std::vector<FaceBox> boxes;
+    boxes.reserve(transfer.faceCorrections.size());
+    for (const FaceCorrection& face : transfer.faceCorrections) {
+        // Each bound is computed in float and only then widened.
+        const float xLow = face.centreX - face.halfSizeX * 2.5f;
+        const float xHigh = face.centreX + face.halfSizeX * 2.5f;
+        const float yLow = face.centreY - face.halfSizeY * 2.5f;
+        const float yHigh = face.centreY + face.halfSizeY * 2.5f;
+        boxes.push_back(FaceBox{xLow, xHigh, yLow, yHigh});
+    }
+    return boxes;
+}
+
+void ApplyTransferWorker::Run(size_t rowBegin, size_t rowEnd, size_t columnBegin, size_t columnEnd) const {
+    // A worker never reads past the face entries of its own record.
+    if (std::min(faceCount, transfer.faceCorrections.size()) > 0 && faceBoxes != nullptr) {
+        RunBand<true>(*this, rowBegin, rowEnd, columnBegin, columnEnd);
+    } else {
+        RunBand<false>(*this, rowBegin, rowEnd, columnBegin, columnEnd);
+    }
+}
+
+Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination) {
+    return Apply(source, transfer, destination, Threading::Parallel);
+}
+
+Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination) {
+    return Apply(source, transfer, destination, Threading::Serial);
+}
+
+}  // namespace vora
