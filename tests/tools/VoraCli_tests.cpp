@@ -27,6 +27,7 @@
 
 #include "model/StyleDatabase.h"
 #include "support/ModelFixtures.h"
+#include "vora/Cli.h"
 #include "vora/TransferJson.h"
 
 namespace {
@@ -193,7 +194,7 @@ FixtureOptions SmallDatabase() { return RandomDatabase(4, 12, 7); }
 TEST_F(CliTest, UsageErrorsExitTwoAndWriteNothing) {
     ModelFixture model(SmallDatabase());
     const std::string m = model.modelDir();
-    ExpectRefused({}, 2, "usage");
+    ExpectRefused({}, 2, "no command given");
     ExpectRefused({"resize"}, 2, "unknown command 'resize'");
     ExpectRefused({"suggest", "photo.png", "--model", m, "--colour", "red"}, 2, "unknown option --colour");
     ExpectRefused({"suggest", "photo.png", "--model", m, "-n", "0"}, 2, "-n");

@@ -17,7 +17,8 @@ namespace vora {
 namespace cli {
 namespace {
 
-using Json = nlohmann::json;
+// Ordered, so that a file reads top-down: format and version first, records last.
+using Json = nlohmann::ordered_json;
 
 uint32_t FloatBits(float value) {
     uint32_t bits;
