@@ -33,6 +33,14 @@ void RequireModelDirectory(const std::string& dir);
 // exception, which is turned into one line here).
 std::unique_ptr<vora_api> OpenModel(const std::string& dir);
 
+struct ModelExamination;
+
+// Completes an examination of the model's files (ModelFiles.h) with the
+// network: constructs a facade on the directory, as any host would, and runs
+// one compute on a small synthetic picture. Adds what fails to the problems;
+// returns a line for a report.
+std::string CheckModelNetwork(ModelExamination& model);
+
 std::string StatusText(Status status);
 // Failure("<subject>: <status in words>") unless status is STATUS_OK.
 void CheckStatus(Status status, const std::string& subject);
