@@ -197,8 +197,7 @@ int Run(const std::vector<std::string>& args) {
         std::cout << "  " << k << "  style " << document.transfers[k].styleIndex << "  cluster "
                   << document.transfers[k].clusterIndex << "  " << proposalPaths[k] << "\n";
 
-    const std::string heading = fs::path(photoPath).filename().string() + "  |  " + faceNote + "  |  model " +
-                                fs::path(document.model).filename().string();
+    const std::string heading = fs::path(photoPath).filename().string() + "  |  " + faceNote + "  |  model " + modelDir;
     WriteImage(sheetPath, ComposeContactSheet(heading, sheet, document.faces));
     WriteFileAtomically(jsonPath, SerializeTransfers(document));
     std::cout << "contact sheet: " << sheetPath << "\ntransfers: " << jsonPath << "\n";

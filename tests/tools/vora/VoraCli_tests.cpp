@@ -550,6 +550,55 @@ TEST_F(CliTest, InspectNamesWhatIsWrongWithEachBrokenModel) {
 }
 
 // =============================================================================
+// build-model
+// =============================================================================
+
+// Four small style photos with different casts and tones.
+void WriteStylePhotos(const std::string& folder) {
+    fs::create_directories(folder);
+    const cv::Vec3f casts[] = {{1.2f, 0.9f, 0.6f}, {0.6f, 0.9f, 1.3f}, {0.8f, 1.2f, 0.7f}, {1.0f, 1.0f, 1.0f}};
+    for (int i = 0; i < 4; ++i) {
+        cv::Mat rgb = TestPhotoRgb(96 + 16 * i, 72);
+        rgb.forEach<cv::Vec3b>([&](cv::Vec3b& p, const int*) {
+            for (int c = 0; c < 3; ++c) p[c] = cv::saturate_cast<uint8_t>(p[c] * casts[i][c] * (0.7f + 0.2f * i));
+        });
+        WriteRgb(folder + "/style-" + std::to_string(i) + ".png", rgb);
+    }
+}
+
+TEST_F(CliTest, BuildModelIsDeterministicAndItsModelWorks) {
+    WriteStylePhotos(m_work + "/styles");
+    const RunResult first = Run({"build-model", "--styles", "styles", "--out", "a", "--clusters", "3"});
+    ASSERT_EQ(first.status, 0) << first.err;
+    EXPECT_NE(first.out.find("3 clusters, 4 styles"), std::string::npos) << first.out;
+    ASSERT_EQ(Run({"build-model", "--styles", "styles", "--out", "b/", "--clusters", "3"}).status, 0);
+    for (const char* name : {vora::kClusterFileName, vora::kStyleFileName, vora::kScoresFileName,
+                             vora::kDistanceFileName, "net/deploy2.prototxt", "net/caffe_reduce_512_model"}) {
+        SCOPED_TRACE(name);
+        const std::string a = Slurp(m_work + "/a/" + name);
+        EXPECT_FALSE(a.empty());
+        EXPECT_EQ(a, Slurp(m_work + "/b/" + name));
+    }
+    EXPECT_EQ(ListTree(m_work + "/a"), ListTree(m_work + "/b"));  // no staging left behind
+
+    const RunResult inspect = Run({"inspect", "a"});
+    EXPECT_EQ(inspect.status, 0) << inspect.out;
+    const RunResult suggest = Run({"suggest", "photo.png", "--model", "a", "-n", "2", "--faces", "none"});
+    EXPECT_EQ(suggest.status, 0) << suggest.err;
+
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "a"}, 2, "a: already holds a model");
+    ExpectRefused({"build-model", "--styles", "styles"}, 2, "--out DIR is required");
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "c", "--clusters", "0"}, 2, "--clusters");
+    ExpectRefused({"build-model", "--styles", "nowhere", "--out", "c"}, 1, "nowhere: no such folder");
+    // The builder's own refusal, after the tool's checks: the folder it would
+    // have made is gone again.
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "c", "--clusters", "999"}, 1, "999 clusters");
+    const RunResult forced = Run({"build-model", "--styles", "styles", "--out", "a", "--clusters", "2", "--force"});
+    EXPECT_EQ(forced.status, 0) << forced.err;
+    EXPECT_NE(Slurp(m_work + "/a/" + vora::kClusterFileName), Slurp(m_work + "/b/" + vora::kClusterFileName));
+}
+
+// =============================================================================
 // export-cube
 // =============================================================================
 

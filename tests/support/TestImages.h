@@ -1,0 +1,32 @@
+#pragma once
+// Synthetic photographs and image-object helpers shared by the test programs.
+
+#include <cstdint>
+#include <vector>
+
+#include <opencv2/core.hpp>
+
+#include <vora/vora.h>
+
+namespace vora {
+namespace testimages {
+
+// A smooth, photo-like R, G, B image (gradients, a few soft blobs, mild
+// noise) with a darker oval where a face would be; deterministic per seed.
+cv::Mat SyntheticPhotoRgb(int rows, int cols, uint32_t seed = 7);
+
+// A whole image object over an R, G, B matrix's pixels (which must be continuous).
+struct ImageHandle {
+    explicit ImageHandle(cv::Mat& rgb);
+    ~ImageHandle();
+    ImageHandle(const ImageHandle&) = delete;
+    ImageHandle& operator=(const ImageHandle&) = delete;
+    IImage* get() const { return image; }
+    IImage* image;
+};
+
+// True when every field of the two records, the face list included, is bit-identical.
+bool SameRecord(const TRANSFER& a, const TRANSFER& b);
+
+}  // namespace testimages
+}  // namespace vora

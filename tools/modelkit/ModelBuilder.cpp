@@ -1,0 +1,301 @@
+#include "modelkit/ModelBuilder.h"
+
+#include <unistd.h>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdint>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <stdexcept>
+
+#include <opencv2/core.hpp>
+
+#include "model/FeatureNetwork.h"
+#include "model/StyleDatabase.h"
+#include "modelkit/Photos.h"
+#include "modelkit/SceneDescriptor.h"
+#include "modelkit/StyleDistance.h"
+#include "semantic/NetworkInput.h"
+#include "transfer/ColourStatistics.h"
+
+namespace fs = std::filesystem;
+
+namespace vora {
+namespace modelkit {
+
+double StyleDistance(const ColourStats& a, const ColourStats& b) {
+    double chroma = 0.0;
+    for (int i = 0; i < 2; ++i) chroma += std::pow(double(a.chromaMean[i]) - b.chromaMean[i], 2);
+    double spread = 0.0;
+    for (int i = 0; i < 4; ++i) spread += std::pow(double(a.chromaSqrtCov[i]) - b.chromaSqrtCov[i], 2);
+    double tone = 0.0;
+    for (int i = 0; i < 32; ++i) tone += std::pow(100.0 * (double(a.lightness[i]) - b.lightness[i]), 2);
+    return chroma + spread / 2.0 + tone / 32.0;
+}
+
+namespace {
+
+// Stored words of a style record: means, square-root covariance, lightness
+// samples; the two percentile points are not part of the file.
+constexpr int kStoredStyleWords = 38;
+
+// Default cluster count: one cluster for every ten content samples (a photo
+// and its five altered copies make six), at least one, at most 1000.
+constexpr int kSamplesPerCluster = 10;
+constexpr int kMaxDefaultClusters = 1000;
+
+// k-means: a fixed seed, so the same photos give the same clusters.
+constexpr uint64_t kClusterSeed = 0x766f7261;  // "vora"
+constexpr int kClusterAttempts = 3;
+
+void Report(const BuildModelOptions& options, double fraction, const std::string& what) {
+    if (options.progress) options.progress(fraction, what);
+}
+
+// A staging folder inside the model folder: the files are written there and
+// renamed into place only once all of them are complete, so a failed build
+// leaves the previous model (or nothing) behind, never a mixture.
+class Staging {
+public:
+    explicit Staging(const fs::path& outDir) : m_outDir(outDir) {
+        std::error_code error;
+        fs::create_directories(outDir, error);
+        if (error || !fs::is_directory(outDir))
+            throw std::runtime_error("cannot create the model folder " + outDir.string());
+        m_path = outDir / (".vora-build-" + std::to_string(::getpid()));
+        fs::remove_all(m_path, error);
+        fs::create_directories(m_path / "net", error);
+        fs::create_directories(m_path / "pooled", error);
+        if (error) throw std::runtime_error("cannot write in the model folder " + outDir.string());
+    }
+    ~Staging() {
+        std::error_code error;
+        fs::remove_all(m_path, error);
+    }
+    Staging(const Staging&) = delete;
+    Staging& operator=(const Staging&) = delete;
+
+    const fs::path& path() const { return m_path; }
+
+    void Publish(const std::vector<std::string>& relativeNames) {
+        std::error_code error;
+        fs::create_directories(m_outDir / "net", error);
+        if (error) throw std::runtime_error("cannot create " + (m_outDir / "net").string());
+        for (const std::string& name : relativeNames) {
+            fs::rename(m_path / name, m_outDir / name, error);
+            if (error) throw std::runtime_error("cannot write " + (m_outDir / name).string() + ": " + error.message());
+        }
+    }
+
+private:
+    fs::path m_outDir;
+    fs::path m_path;
+};
+
+class BinaryFile {
+public:
+    explicit BinaryFile(fs::path path) : m_path(std::move(path)), m_file(m_path, std::ios::binary | std::ios::trunc) {
+        if (!m_file) throw std::runtime_error("cannot write " + m_path.string());
+    }
+    // The files are little-endian, as this machine is.
+    void Int(int32_t value) { Bytes(&value, sizeof value); }
+    void Floats(const float* values, size_t count) { Bytes(values, count * sizeof(float)); }
+    void Close() {
+        m_file.close();
+        if (!m_file) throw std::runtime_error("cannot write " + m_path.string());
+    }
+
+private:
+    void Bytes(const void* data, size_t size) { m_file.write(static_cast<const char*>(data), static_cast<std::streamsize>(size)); }
+    fs::path m_path;
+    std::ofstream m_file;
+};
+
+ColourStats StyleStats(const cv::Mat& bgr8) {
+    cv::Mat lab;
+    lab.create(bgr8.rows, bgr8.cols, CV_32FC3);
+    ConvertToLab(bgr8, lab);
+    ColourStats stats{};
+    ComputeChromaStats(lab, stats);
+    ComputeLightnessStats(lab, stats);
+    return stats;
+}
+
+// The pooled features of one image, through the network exactly as the
+// library prepares its input.
+cv::Mat PooledRow(FeatureNetwork& network, const cv::Mat& bgr8) {
+    cv::Mat canvas;
+    PrepareNetworkImage(bgr8, canvas, kNetworkImageSize, kNetworkInputSize);
+    const std::vector<float> pooled = network.Forward(canvas);
+    if (pooled.size() != static_cast<size_t>(PooledFeatureSize()))
+        throw std::runtime_error("the scene descriptor network gave an output of unexpected size");
+    return cv::Mat(pooled, true).reshape(1, 1);
+}
+
+double EuclideanDistance(const float* a, const float* b, int size) {
+    double sum = 0.0;
+    for (int i = 0; i < size; ++i) sum += (double(a[i]) - b[i]) * (double(a[i]) - b[i]);
+    return std::sqrt(sum);
+}
+
+// Score of style s for cluster k: how much nearer the cluster centre is to
+// the style photo's own descriptor than the average centre is,
+//   score = mean_j |c_j - f_s| - |c_k - f_s|,
+// so styles taken from scenes like the cluster's rank first. Subtracting the
+// plain distance alone would let a few styles that sit near the middle of
+// the descriptor space ("hubs") head every cluster's ranking.
+std::vector<float> ClusterStyleScores(const cv::Mat& centres, const cv::Mat& styleFeatures) {
+    const int clusters = centres.rows;
+    const int styles = styleFeatures.rows;
+    std::vector<double> distance(static_cast<size_t>(clusters) * styles);
+    std::vector<double> mean(styles, 0.0);
+    for (int k = 0; k < clusters; ++k) {
+        for (int s = 0; s < styles; ++s) {
+            const double d = EuclideanDistance(centres.ptr<float>(k), styleFeatures.ptr<float>(s), centres.cols);
+            distance[static_cast<size_t>(k) * styles + s] = d;
+            mean[s] += d / clusters;
+        }
+    }
+    std::vector<float> scores(distance.size());
+    for (int k = 0; k < clusters; ++k)
+        for (int s = 0; s < styles; ++s) {
+            const size_t i = static_cast<size_t>(k) * styles + s;
+            scores[i] = static_cast<float>(mean[s] - distance[i]);
+        }
+    return scores;
+}
+
+}  // namespace
+
+void BuildModel(const BuildModelOptions& options) {
+    if (options.stylesDir.empty()) throw std::runtime_error("no style photo folder given");
+    if (options.outDir.empty()) throw std::runtime_error("no model folder given");
+    if (options.clusters < 0) throw std::runtime_error("the number of clusters cannot be negative");
+
+    Report(options, 0.0, "listing photos");
+    const std::vector<std::string> stylePaths = ListPhotos(options.stylesDir);
+    if (stylePaths.size() < 2)
+        throw std::runtime_error("need at least 2 style photos in " + options.stylesDir + ", found " +
+                                 std::to_string(stylePaths.size()) +
+                                 " (the library offers only the better half of the styles)");
+    std::vector<std::string> contentPaths;
+    if (!options.contentDir.empty()) {
+        contentPaths = ListPhotos(options.contentDir);
+        if (contentPaths.empty()) throw std::runtime_error("no photos in " + options.contentDir);
+    }
+    // Each style photo gives itself and its altered copies, unless content
+    // photos are given.
+    const int samples = contentPaths.empty() ? static_cast<int>(stylePaths.size() * (1 + AllAlterations().size()))
+                                             : static_cast<int>(contentPaths.size());
+    int clusters = options.clusters;
+    if (clusters == 0) {
+        clusters = std::min({kMaxDefaultClusters, samples,
+                             std::max(1, static_cast<int>(std::lround(double(samples) / kSamplesPerCluster)))});
+    } else if (clusters > samples) {
+        throw std::runtime_error("cannot make " + std::to_string(clusters) + " clusters from " + std::to_string(samples) +
+                                 " content samples; ask for at most " + std::to_string(samples));
+    }
+
+    Staging staging(options.outDir);
+    const fs::path pooledDir = staging.path() / "pooled";
+    WriteNetworkFiles(PooledFeatureNetwork(), pooledDir.string());
+    std::unique_ptr<FeatureNetwork> pooledNet =
+        FeatureNetwork::Load((pooledDir / kNetworkDefinitionName).string(), (pooledDir / kNetworkWeightsName).string());
+
+    // Style records, each style's own pooled feature, and the content samples.
+    const int styleCount = static_cast<int>(stylePaths.size());
+    const double photoCount = static_cast<double>(stylePaths.size() + contentPaths.size());
+    std::vector<ColourStats> styles(stylePaths.size());
+    cv::Mat stylePooled(0, PooledFeatureSize(), CV_32F);
+    cv::Mat contentPooled(0, PooledFeatureSize(), CV_32F);
+    for (int s = 0; s < styleCount; ++s) {
+        Report(options, 0.8 * s / photoCount, "reading " + fs::path(stylePaths[s]).filename().string());
+        const cv::Mat photo = ReadPhoto(stylePaths[s]);
+        styles[s] = StyleStats(photo);
+        stylePooled.push_back(PooledRow(*pooledNet, photo));
+        if (contentPaths.empty()) {
+            contentPooled.push_back(stylePooled.row(s));
+            for (Alteration alteration : AllAlterations()) contentPooled.push_back(PooledRow(*pooledNet, Alter(photo, alteration)));
+        }
+    }
+    for (size_t c = 0; c < contentPaths.size(); ++c) {
+        Report(options, 0.8 * (styleCount + c) / photoCount, "reading " + fs::path(contentPaths[c]).filename().string());
+        contentPooled.push_back(PooledRow(*pooledNet, ReadPhoto(contentPaths[c])));
+    }
+    pooledNet.reset();
+
+    // The final map of the descriptor, fitted on every photo seen.
+    Report(options, 0.8, "fitting the scene descriptor");
+    cv::Mat fitRows = contentPooled.clone();
+    if (!contentPaths.empty()) fitRows.push_back(stylePooled);
+    const Projection projection = FitProjection(fitRows);
+    auto describe = [&](const cv::Mat& pooled) {
+        cv::Mat out(pooled.rows, kDescriptorSize, CV_32F);
+        for (int r = 0; r < pooled.rows; ++r) {
+            const std::vector<float> row = Project(projection, pooled.ptr<float>(r));
+            std::memcpy(out.ptr<float>(r), row.data(), row.size() * sizeof(float));
+        }
+        return out;
+    };
+    const cv::Mat styleFeatures = describe(stylePooled);
+    const cv::Mat contentFeatures = describe(contentPooled);
+
+    // Semantic clusters of the content samples.
+    Report(options, 0.85, "clustering " + std::to_string(samples) + " samples into " + std::to_string(clusters));
+    cv::Mat labels, centres;
+    {
+        cv::RNG& rng = cv::theRNG();
+        const uint64 saved = rng.state;
+        rng.state = kClusterSeed;
+        cv::kmeans(contentFeatures, clusters, labels,
+                   cv::TermCriteria(cv::TermCriteria::COUNT + cv::TermCriteria::EPS, 100, 1e-4), kClusterAttempts,
+                   cv::KMEANS_PP_CENTERS, centres);
+        rng.state = saved;
+    }
+
+    // Files, staged.
+    Report(options, 0.95, "writing the model");
+    const fs::path stage = staging.path();
+    {
+        BinaryFile file(stage / kClusterFileName);
+        file.Int(clusters);
+        for (int k = 0; k < clusters; ++k) file.Floats(centres.ptr<float>(k), kDescriptorSize);
+        file.Close();
+    }
+    {
+        BinaryFile file(stage / kStyleFileName);
+        file.Int(styleCount);
+        for (const ColourStats& style : styles) file.Floats(style.data(), kStoredStyleWords);
+        file.Close();
+    }
+    {
+        BinaryFile file(stage / kScoresFileName);
+        file.Int(clusters);
+        file.Int(styleCount);
+        const std::vector<float> scores = ClusterStyleScores(centres, styleFeatures);
+        file.Floats(scores.data(), scores.size());
+        file.Close();
+    }
+    {
+        BinaryFile file(stage / kDistanceFileName);
+        file.Int(styleCount);
+        std::vector<float> row;
+        for (int i = 0; i < styleCount; ++i) {
+            row.clear();
+            for (int j = i; j < styleCount; ++j) row.push_back(static_cast<float>(StyleDistance(styles[i], styles[j])));
+            file.Floats(row.data(), row.size());
+        }
+        file.Close();
+    }
+    WriteNetworkFiles(DescriptorNetwork(projection), (stage / "net").string());
+
+    const std::string net = kNetworkFolder;
+    staging.Publish({kClusterFileName, kStyleFileName, kScoresFileName, kDistanceFileName,
+                     net + kNetworkDefinitionName, net + kNetworkWeightsName});
+    Report(options, 1.0, "done");
+}
+
+}  // namespace modelkit
+}  // namespace vora
