@@ -16,6 +16,11 @@ namespace vora {
 namespace cli {
 namespace {
 
+// The format allows 256, but such a table is 16.7 million lines (some 450 MB
+// of text, built in memory); 129 points, a step of two 8-bit levels, is
+// finer than the 17, 33 or 65 that tables are used at.
+constexpr long long kMaxSize = 129;
+
 const char* const kSynopsis = "export-cube TRANSFERS.json[:K] OUT.cube [--size N] [--model DIR] [--force]";
 
 const char* const kHelp =
@@ -28,7 +33,7 @@ const char* const kHelp =
     "as byte / 255. Face corrections depend on the place in the picture and are\n"
     "left out: a lookup table knows only colours.\n"
     "\n"
-    "  --size N     lattice points per axis, 2 to 256 (default 33)\n"
+    "  --size N     lattice points per axis, 2 to 129 (default 33)\n"
     "  --model DIR  model directory to open (the library needs one to render);\n"
     "               default: the one recorded in the file, else $VORA_MODEL,\n"
     "               else ./model\n"
@@ -41,7 +46,7 @@ int Run(const std::vector<std::string>& args) {
     const std::string outPath = parsed.positionals()[1];
     const bool force = parsed.Flag("--force");
     int size = 33;
-    if (auto v = parsed.Value("--size")) size = static_cast<int>(ParseInteger(*v, "--size", 2, 256));
+    if (auto v = parsed.Value("--size")) size = static_cast<int>(ParseInteger(*v, "--size", 2, kMaxSize));
     if (std::filesystem::path(outPath).extension() != ".cube")
         throw UsageError(outPath + ": the lookup table's name should end in .cube");
     CheckOutputPath(outPath, {reference.path}, force);
