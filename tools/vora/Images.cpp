@@ -1,0 +1,165 @@
+#include "vora/Images.h"
+
+#include <algorithm>
+#include <cctype>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <vector>
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <opencv2/imgcodecs.hpp>
+#include <opencv2/imgproc.hpp>
+
+#include "vora/Cli.h"
+#include "vora/OutputFiles.h"
+
+namespace vora {
+namespace cli {
+namespace {
+
+std::string LowerExtension(const std::string& path) {
+    std::string ext = std::filesystem::path(path).extension().string();
+    std::transform(ext.begin(), ext.end(), ext.begin(), [](unsigned char c) { return std::tolower(c); });
+    return ext;
+}
+
+// The image decoders' libraries print their own warnings (libpng: "known
+// incorrect sRGB profile") straight to standard error; we report failures
+// ourselves, in one line, so their chatter is muted while decoding.
+class MutedStandardError {
+public:
+    MutedStandardError() {
+        std::fflush(stderr);
+        m_saved = dup(STDERR_FILENO);
+        const int null = open("/dev/null", O_WRONLY);
+        if (m_saved >= 0 && null >= 0) dup2(null, STDERR_FILENO);
+        if (null >= 0) close(null);
+    }
+    ~MutedStandardError() {
+        std::fflush(stderr);
+        if (m_saved >= 0) {
+            dup2(m_saved, STDERR_FILENO);
+            close(m_saved);
+        }
+    }
+    MutedStandardError(const MutedStandardError&) = delete;
+    MutedStandardError& operator=(const MutedStandardError&) = delete;
+
+private:
+    int m_saved = -1;
+};
+
+bool IsJpeg(const std::vector<uchar>& bytes) {
+    return bytes.size() >= 3 && bytes[0] == 0xFF && bytes[1] == 0xD8 && bytes[2] == 0xFF;
+}
+
+}  // namespace
+
+Photo ReadPhoto(const std::string& path) {
+    std::error_code ec;
+    if (!std::filesystem::exists(path, ec)) throw Failure(path, "no such file");
+    if (std::filesystem::is_directory(path, ec)) throw Failure(path, "is a directory, not an image");
+    std::ifstream in(path, std::ios::binary);
+    if (!in) throw Failure(path, "cannot open file");
+    std::vector<uchar> bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
+    if (in.bad()) throw Failure(path, "cannot read file");
+    if (bytes.empty()) throw Failure(path, "cannot read image (the file is empty)");
+
+    // JPEG carries no alpha, so it is decoded the ordinary way, which also
+    // turns the picture upright as its EXIF orientation says. Other formats
+    // are decoded unchanged to keep their alpha channel and sample depth.
+    const int flags = IsJpeg(bytes) ? (cv::IMREAD_ANYDEPTH | cv::IMREAD_ANYCOLOR) : cv::IMREAD_UNCHANGED;
+    cv::Mat decoded;
+    try {
+        MutedStandardError muted;
+        decoded = cv::imdecode(bytes, flags);
+    } catch (const cv::Exception&) {
+        decoded.release();
+    }
+    if (decoded.empty())
+        throw Failure(path, "cannot read image (not a JPEG, PNG, TIFF or WebP file, or damaged)");
+    if (decoded.dims != 2 || decoded.rows < 1 || decoded.cols < 1) throw Failure(path, "cannot read image (no pixels)");
+
+    if (decoded.depth() == CV_16U) {
+        PrintNotice(path + ": 16-bit samples reduced to 8 bits");
+        cv::Mat reduced;
+        decoded.convertTo(reduced, CV_8U, 1.0 / 257.0);  // 65535 -> 255, rounded
+        decoded = reduced;
+    } else if (decoded.depth() != CV_8U) {
+        throw Failure(path, "cannot read image (samples are neither 8- nor 16-bit integers)");
+    }
+
+    Photo photo;
+    photo.path = path;
+    switch (decoded.channels()) {
+    case 1:
+        cv::cvtColor(decoded, photo.pixels, cv::COLOR_GRAY2RGB);
+        break;
+    case 2: {
+        // Grey and alpha.
+        cv::Mat planes[2];
+        cv::split(decoded, planes);
+        cv::Mat merged[4] = {planes[0], planes[0], planes[0], planes[1]};
+        cv::merge(merged, 4, photo.pixels);
+        break;
+    }
+    case 3:
+        cv::cvtColor(decoded, photo.pixels, cv::COLOR_BGR2RGB);
+        break;
+    case 4:
+        cv::cvtColor(decoded, photo.pixels, cv::COLOR_BGRA2RGBA);
+        break;
+    default:
+        throw Failure(path, "cannot read image (" + std::to_string(decoded.channels()) + " channels)");
+    }
+    if (!photo.pixels.isContinuous()) photo.pixels = photo.pixels.clone();
+    return photo;
+}
+
+cv::Mat PackedRgb(const Photo& photo) {
+    if (!photo.hasAlpha()) return photo.pixels;
+    cv::Mat rgb;
+    cv::cvtColor(photo.pixels, rgb, cv::COLOR_RGBA2RGB);
+    return rgb;
+}
+
+void CheckImageExtension(const std::string& path) {
+    static const char* const kKnown[] = {".jpg", ".jpeg", ".png", ".tif", ".tiff", ".webp"};
+    const std::string ext = LowerExtension(path);
+    for (const char* known : kKnown)
+        if (ext == known) return;
+    throw UsageError(path + ": unknown image format '" + ext +
+                     "' (the extension chooses it: .jpg, .png, .tif or .webp)");
+}
+
+void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba) {
+    const std::string ext = LowerExtension(path);
+    cv::Mat bgr;
+    std::vector<int> params;
+    if (ext == ".jpg" || ext == ".jpeg") {
+        if (rgbOrRgba.channels() == 4) PrintNotice(path + ": JPEG has no alpha channel; it is dropped");
+        cv::cvtColor(rgbOrRgba, bgr, rgbOrRgba.channels() == 4 ? cv::COLOR_RGBA2BGR : cv::COLOR_RGB2BGR);
+        params = {cv::IMWRITE_JPEG_QUALITY, 95};
+    } else {
+        cv::cvtColor(rgbOrRgba, bgr, rgbOrRgba.channels() == 4 ? cv::COLOR_RGBA2BGRA : cv::COLOR_RGB2BGR);
+        // WebP at quality above 100 is lossless: a restyled photo should not
+        // lose more than the JPEG it may have come from.
+        if (ext == ".webp") params = {cv::IMWRITE_WEBP_QUALITY, 101};
+    }
+    std::vector<uchar> encoded;
+    bool ok = false;
+    try {
+        ok = cv::imencode(ext, bgr, encoded, params);
+    } catch (const cv::Exception& e) {
+        throw Failure(path, "cannot encode image (" + e.err + ")");
+    }
+    if (!ok) throw Failure(path, "cannot encode image");
+    WriteFileAtomically(path, std::string(encoded.begin(), encoded.end()));
+}
+
+}  // namespace cli
+}  // namespace vora
