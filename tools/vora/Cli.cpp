@@ -11,12 +11,12 @@
 namespace vora {
 namespace cli {
 
-ParsedArgs::ParsedArgs(const std::string& command, const std::vector<OptionSpec>& specs,
+ParsedArgs::ParsedArgs(const std::string& command, const std::vector<OptionSpec>& optionSpecs,
                        const std::vector<std::string>& args)
     : m_command(command) {
     auto findSpec = [&](const std::string& token) -> const OptionSpec* {
-        for (const OptionSpec& spec : specs)
-            if (token == spec.name || (!spec.shortName.empty() && token == spec.shortName)) return &spec;
+        for (const OptionSpec& optionSpec : optionSpecs)
+            if (token == optionSpec.name || (!optionSpec.shortName.empty() && token == optionSpec.shortName)) return &optionSpec;
         return nullptr;
     };
 
@@ -44,23 +44,23 @@ ParsedArgs::ParsedArgs(const std::string& command, const std::vector<OptionSpec>
             name = token.substr(0, equals);
             inlineValue = token.substr(equals + 1);
         }
-        const OptionSpec* spec = findSpec(name);
-        if (!spec) {
+        const OptionSpec* optionSpec = findSpec(name);
+        if (!optionSpec) {
             // "-5" style negative numbers are not options anywhere in this tool.
             throw UsageError(m_command + ": unknown option " + name + " (see vora " + m_command + " --help)");
         }
-        std::vector<std::string>& slot = m_values[spec->name];
-        if (!slot.empty() && !spec->repeatable)
-            throw UsageError(m_command + ": option " + spec->name + " given more than once");
-        if (!spec->takesValue) {
-            if (inlineValue) throw UsageError(m_command + ": option " + spec->name + " takes no value");
+        std::vector<std::string>& slot = m_values[optionSpec->name];
+        if (!slot.empty() && !optionSpec->repeatable)
+            throw UsageError(m_command + ": option " + optionSpec->name + " given more than once");
+        if (!optionSpec->takesValue) {
+            if (inlineValue) throw UsageError(m_command + ": option " + optionSpec->name + " takes no value");
             slot.push_back("");
             continue;
         }
         if (inlineValue) {
             slot.push_back(*inlineValue);
         } else {
-            if (i + 1 >= args.size()) throw UsageError(m_command + ": option " + spec->name + " needs a value");
+            if (i + 1 >= args.size()) throw UsageError(m_command + ": option " + optionSpec->name + " needs a value");
             slot.push_back(args[++i]);
         }
     }

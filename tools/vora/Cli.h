@@ -58,7 +58,7 @@ inline OptionSpec FlagOption(const std::string& name) { return OptionSpec{name, 
 // usage errors. "--help" and "-h" are recognised by every command.
 class ParsedArgs {
 public:
-    ParsedArgs(const std::string& command, const std::vector<OptionSpec>& specs,
+    ParsedArgs(const std::string& command, const std::vector<OptionSpec>& optionSpecs,
                const std::vector<std::string>& args);
 
     bool helpRequested() const { return m_help; }
