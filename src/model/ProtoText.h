@@ -6,6 +6,7 @@
 // concatenation, repeated fields and the `[a, b]` list shorthand. Field names
 // are kept as written; nothing is checked against a schema.
 
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -44,6 +45,9 @@ Message Parse(const std::string& text);
 
 // Writes the tree back as text that Parse (and any text-format reader) accepts.
 std::string Write(const Message& message);
+
+// Appends one code point as UTF-8 (escapes here, resource names elsewhere).
+void AppendUtf8(std::string& out, uint32_t code);
 
 }  // namespace prototext
 }  // namespace vora

@@ -7,6 +7,8 @@
 
 #include <zlib.h>
 
+#include "model/ProtoText.h"
+
 namespace vora {
 namespace modelkit {
 namespace {
@@ -77,30 +79,12 @@ private:
                     ++i;
                 }
             }
-            AppendUtf8(utf8, code);
+            prototext::AppendUtf8(utf8, code);
         }
         if (utf8.empty() || utf8 == "." || utf8 == ".." || utf8.find('/') != std::string::npos ||
             utf8.find('\0') != std::string::npos)
             throw std::runtime_error("Qt resource archive holds an unsafe file name");
         return utf8;
-    }
-
-    static void AppendUtf8(std::string& out, uint32_t code) {
-        if (code < 0x80) {
-            out.push_back(static_cast<char>(code));
-        } else if (code < 0x800) {
-            out.push_back(static_cast<char>(0xC0 | (code >> 6)));
-            out.push_back(static_cast<char>(0x80 | (code & 0x3F)));
-        } else if (code < 0x10000) {
-            out.push_back(static_cast<char>(0xE0 | (code >> 12)));
-            out.push_back(static_cast<char>(0x80 | ((code >> 6) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | (code & 0x3F)));
-        } else {
-            out.push_back(static_cast<char>(0xF0 | (code >> 18)));
-            out.push_back(static_cast<char>(0x80 | ((code >> 12) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | ((code >> 6) & 0x3F)));
-            out.push_back(static_cast<char>(0x80 | (code & 0x3F)));
-        }
     }
 
     std::string Data(const std::string& path, uint16_t flags, uint32_t dataOffset) const {
