@@ -1,7 +1,8 @@
 #include <gtest/gtest.h>
 
-#include <cmath>
 #include <limits>
+#include <regex>
+#include <string>
 #include <vector>
 
 #include "model/Engine.h"
@@ -10,104 +11,63 @@
 namespace vora {
 namespace {
 
-// An engine with one cluster per ranking row and a chosen distance matrix
-// (stored as squared "Lab" distances, as the selection takes their root).
-class Ranking : public testing::Test {
-protected:
-    void SetTables(std::vector<std::vector<int32_t>> ranking, std::vector<std::vector<float>> distances) {
-        engine.rankedStyles = std::move(ranking);
-        engine.styleDistances = std::move(distances);
-        engine.clusterCount = static_cast<int32_t>(engine.rankedStyles.size());
-        engine.styleCount = static_cast<int32_t>(engine.styleDistances.size());
-        engine.scoreColumns = engine.styleCount;
-        engine.clusterCentres.assign(engine.rankedStyles.size(), ClusterCentre{});
-    }
+using Table = std::vector<std::vector<float>>;
 
-    Status Select(uint64_t n, float factor, int32_t nearest = 0) {
-        VoraParameters params;
-        params.numTransfers = n;
-        params.rankingFactor = factor;
-        return SelectStyles(engine, ColourStats{}, {nearest}, clusters, styles, params);
-    }
+Table Roots(size_t n, float d) {  // every style d from every other
+    Table roots(n, std::vector<float>(n, d));
+    for (size_t i = 0; i < n; ++i) roots[i][i] = 0.0f;
+    return roots;
+}
 
-    // Squared distances: root d(i, j) given by the caller.
-    static std::vector<std::vector<float>> Squared(const std::vector<std::vector<float>>& roots) {
-        std::vector<std::vector<float>> out = roots;
-        for (auto& row : out)
-            for (float& v : row) v = v * v;
-        return out;
-    }
-
+// Runs the selection on an engine with one cluster per ranking row and the given
+// distances (roots; the engine stores squares). Returns "styles ... from <clusters>"
+// or the refusal.
+std::string Select(const std::vector<std::vector<int32_t>>& ranking, Table distances, uint64_t n, float factor,
+                   int32_t nearest = 0) {
     Engine engine;
-    std::vector<int32_t> clusters;
-    std::vector<int32_t> styles;
-};
-
-TEST_F(Ranking, OneStyleIsTheBestScoredWhateverTheFactor) {
-    SetTables({{3, 1, -1, -1}}, Squared({{0, 1, 1, 1}, {1, 0, 1, 1}, {1, 1, 0, 1}, {1, 1, 1, 0}}));
-    for (float factor : {0.0f, 1.0f, 100.0f}) {
-        ASSERT_EQ(Select(1, factor), STATUS_OK);
-        EXPECT_EQ(styles, std::vector<int32_t>({3}));
-        EXPECT_EQ(clusters, std::vector<int32_t>({0}));
+    for (auto& row : distances) {
+        for (float& v : row) v *= v;
     }
+    engine.rankedStyles = ranking;
+    engine.styleDistances = distances;
+    engine.clusterCount = static_cast<int32_t>(ranking.size());
+    engine.styleCount = engine.scoreColumns = static_cast<int32_t>(distances.size());
+    engine.clusterCentres.assign(ranking.size(), ClusterCentre{});
+    VoraParameters params;
+    params.numTransfers = n;
+    params.rankingFactor = factor;
+    std::vector<int32_t> clusters, styles;
+    const Status status = SelectStyles(engine, ColourStats{}, {nearest}, clusters, styles, params);
+    std::string text = status == STATUS_OK ? "styles" : "refused " + std::to_string(status);
+    for (int32_t s : styles) text += " " + std::to_string(s);
+    text += " from";
+    for (int32_t c : clusters) text += " " + std::to_string(c);
+    return text;
+}
+std::string Refused(Status status) { return "refused " + std::to_string(status) + " from"; }
+
+TEST(SelectStyles, ChoosesInScoreOrderKeepingStylesApart) {
+    for (float factor : {0.0f, 1.0f, 100.0f}) {
+        EXPECT_EQ(Select({{3, 1, -1, -1}}, Roots(4, 1), 1, factor), "styles 3 from 0");  // the best, whatever t
+    }
+    EXPECT_EQ(Select({{2, -1, 0, 1}}, Roots(4, 1), 3, 0.0f), "styles 2 0 1 from 0 0 0");  // no diversity: score order
+    // t = 15 skips style 1, only 12 from style 0.
+    EXPECT_EQ(Select({{0, 1, 2}}, {{0, 12, 20}, {12, 0, 20}, {20, 20, 0}}, 2, 1.0f), "styles 0 2 from 0 0");
+    // t relaxes 15 -> 12 -> 9.6; at 9.6 style 2 (9 from style 0) still fails and style 1 (10) passes.
+    EXPECT_EQ(Select({{0, 2, 1}}, {{0, 10, 9}, {10, 0, 12}, {9, 12, 0}}, 2, 1.0f), "styles 0 1 from 0 0");
+    // Two valid entries: once t has shrunk to 0 the chosen ones pass again, in scan order.
+    EXPECT_EQ(Select({{1, 0, -1, -1}}, Roots(4, 30), 4, 1.0f), "styles 1 0 1 0 from 0 0 0 0");
+    EXPECT_EQ(Select({{0, 1, -1}, {2, 1, -1}}, Roots(3, 20), 2, 1.0f, 1), "styles 2 1 from 1 1");  // nearest only
 }
 
-TEST_F(Ranking, ZeroFactorTakesTheFirstValidPositionsInScoreOrder) {
-    SetTables({{2, -1, 0, 1}}, Squared({{0, 1, 1, 1}, {1, 0, 1, 1}, {1, 1, 0, 1}, {1, 1, 1, 0}}));
-    ASSERT_EQ(Select(3, 0.0f), STATUS_OK);
-    EXPECT_EQ(styles, std::vector<int32_t>({2, 0, 1}));
-}
-
-TEST_F(Ranking, DiversityFilterSkipsCloseStyles) {
-    // Style 1 is 5 from style 0, style 2 is 20 from both: with t = 15 the
-    // second choice skips 1.
-    SetTables({{0, 1, 2}}, Squared({{0, 5, 20}, {5, 0, 20}, {20, 20, 0}}));
-    ASSERT_EQ(Select(2, 1.0f), STATUS_OK);
-    EXPECT_EQ(styles, std::vector<int32_t>({0, 2}));
-}
-
-TEST_F(Ranking, RelaxesUntilEnoughStylesPass) {
-    // All roots below 15. t runs 15 -> 12 -> 9.6: at 12 neither style 2
-    // (root 9 to style 0) nor style 1 (root 10) passes; at 9.6 style 2 still
-    // fails and style 1 passes, though it scores below style 2.
-    SetTables({{0, 2, 1}}, Squared({{0, 10, 9}, {10, 0, 12}, {9, 12, 0}}));
-    ASSERT_EQ(Select(2, 1.0f), STATUS_OK);
-    EXPECT_EQ(styles, std::vector<int32_t>({0, 1}));
-}
-
-TEST_F(Ranking, RepeatsStylesWhenTooFewCanPass) {
-    SetTables({{1, 0, -1, -1}}, Squared({{0, 30, 30, 30}, {30, 0, 30, 30}, {30, 30, 0, 30}, {30, 30, 30, 0}}));
-    ASSERT_EQ(Select(4, 1.0f), STATUS_OK);
-    ASSERT_EQ(styles.size(), 4u);
-    EXPECT_EQ(styles[0], 1);
-    EXPECT_EQ(styles[1], 0);
-    // Only two valid entries: once the threshold has shrunk to 0 the chosen
-    // ones are accepted again, in scan order.
-    EXPECT_EQ(styles[2], 1);
-    EXPECT_EQ(styles[3], 0);
-}
-
-TEST_F(Ranking, OnlyTheNearestClusterIsConsulted) {
-    SetTables({{0, 1, -1}, {2, 1, -1}}, Squared({{0, 20, 20}, {20, 0, 20}, {20, 20, 0}}));
-    ASSERT_EQ(Select(2, 1.0f, 1), STATUS_OK);
-    EXPECT_EQ(styles, std::vector<int32_t>({2, 1}));
-    EXPECT_EQ(clusters, std::vector<int32_t>({1, 1}));
-}
-
-TEST_F(Ranking, RefusesSelectionsThatCouldNeverFinish) {
-    SetTables({{-1, -1}}, Squared({{0, 1}, {1, 0}}));
-    EXPECT_EQ(Select(2, 1.0f), STATUS_NO_USABLE_STYLE);
-    EXPECT_EQ(Select(0, 1.0f), STATUS_NO_TRANSFERS_REQUESTED);
-    EXPECT_EQ(Select(1, 1.0f, 5), STATUS_MODEL_INCOMPLETE);  // cluster outside the table
-    EXPECT_TRUE(styles.empty());
-}
-
-TEST_F(Ranking, ExtremeFactorsStillFinish) {
-    SetTables({{0, 1}}, Squared({{0, 1}, {1, 0}}));
-    for (float factor : {std::numeric_limits<float>::infinity(), std::numeric_limits<float>::quiet_NaN(),
-                         -3.0f, 1e30f}) {
-        ASSERT_EQ(Select(3, factor), STATUS_OK) << factor;
-        EXPECT_EQ(styles.size(), 3u);
+TEST(SelectStyles, RefusesSelectionsThatCouldNeverFinishAndEndsWithExtremeFactors) {
+    EXPECT_EQ(Select({{-1, -1}}, Roots(2, 1), 2, 1.0f), Refused(STATUS_NO_USABLE_STYLE));
+    EXPECT_EQ(Select({{0, 1}}, Roots(2, 1), 0, 1.0f), Refused(STATUS_NO_TRANSFERS_REQUESTED));
+    EXPECT_EQ(Select({{0, 1}}, Roots(2, 1), 1, 1.0f, 5), Refused(STATUS_MODEL_INCOMPLETE));  // no cluster 5
+    const std::regex threeStyles("styles( [01]){3} from( 0){3}");
+    const float infinity = std::numeric_limits<float>::infinity(), nan = std::numeric_limits<float>::quiet_NaN();
+    for (float factor : {infinity, nan, -3.0f, 1e30f}) {
+        EXPECT_TRUE(std::regex_match(Select({{0, 1}}, Roots(2, 1), 3, factor), threeStyles)) << factor;
     }
 }
 
@@ -117,7 +77,7 @@ TEST(OrderClusters, SortsByEuclideanDistance) {
     engine.clusterCentres[0].fill(3.0f);
     engine.clusterCentres[1].fill(1.0f);
     engine.clusterCentres[2].fill(-2.0f);
-    std::vector<float> feature(512, 0.5f);
+    const std::vector<float> feature(512, 0.5f);
     std::vector<int32_t> order(3, -1);
     EXPECT_EQ(OrderClusters(engine, feature.data(), order), 0);
     EXPECT_EQ(order, std::vector<int32_t>({1, 0, 2}));
