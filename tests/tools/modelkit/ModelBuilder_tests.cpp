@@ -1,17 +1,13 @@
 #include "modelkit/ModelBuilder.h"
 
-#include <unistd.h>
-
+#include <algorithm>
 #include <cmath>
-#include <cstring>
-#include <filesystem>
-#include <fstream>
-#include <sstream>
+#include <map>
+#include <tuple>
 
-#include <gtest/gtest.h>
 #include <opencv2/imgcodecs.hpp>
-#include <opencv2/imgproc.hpp>
 
+#include "KitTesting.h"
 #include "model/FeatureNetwork.h"
 #include "model/StyleDatabase.h"
 #include "modelkit/Photos.h"
@@ -19,64 +15,60 @@
 #include "semantic/NetworkInput.h"
 #include "transfer/ColourStatistics.h"
 
-namespace fs = std::filesystem;
 using namespace vora;
 using namespace vora::modelkit;
+using namespace kit_testing;
 
 namespace {
 
-struct TempDir {
-    fs::path path;
-    explicit TempDir(const std::string& tag) {
-        path = fs::temp_directory_path() / ("vora_builder_" + std::to_string(::getpid()) + "_" + tag + "_" +
-                                            ::testing::UnitTest::GetInstance()->current_test_info()->name());
-        fs::remove_all(path);
-        fs::create_directories(path);
+// Style photos in several formats, each with the 8-bit BGR image it must be
+// read as; names sort as listed.
+std::vector<cv::Mat> WriteStyles(const fs::path& dir) {
+    cv::Mat grey, greyBgr, deep, alpha(96, 128, CV_8U), withAlpha;
+    cv::cvtColor(Scene(2), grey, cv::COLOR_BGR2GRAY);
+    cv::cvtColor(grey, greyBgr, cv::COLOR_GRAY2BGR);
+    Scene(3).convertTo(deep, CV_16U, 257.0, 100.0);  // reduces to the nearest 8-bit value
+    cv::randu(alpha, 0, 256);
+    cv::merge(std::vector<cv::Mat>{Scene(4), alpha}, withAlpha);
+    const std::vector<std::tuple<std::string, cv::Mat, cv::Mat>> files = {
+        {"a_plain.png", Scene(1), Scene(1)},         {"b_grey.png", grey, greyBgr},
+        {"c_deep.png", deep, Scene(3)},              {"d_alpha.png", withAlpha, Scene(4)},
+        {"e_tiff.TIF", Scene(5), Scene(5)},          {"f_lossless.webp", Scene(6, 130, 90), Scene(6, 130, 90)}};
+    std::vector<cv::Mat> asRead;
+    for (const auto& [name, written, expected] : files) {
+        EXPECT_TRUE(cv::imwrite((dir / name).string(), written, {cv::IMWRITE_WEBP_QUALITY, 101})) << name;
+        asRead.push_back(expected);
     }
-    ~TempDir() { fs::remove_all(path); }
+    std::ofstream(dir / "notes.txt") << "not a photo";  // ignored
+    return asRead;
+}
+
+// The style set and its default model, built once for the tests that only read them.
+struct Built {
+    TempDir styles, model;
+    std::vector<cv::Mat> asRead = WriteStyles(styles.path);
+    std::vector<double> progress;
+    Built() {
+        BuildModel({styles.path.string(), "", model.path.string(), 0,
+                    [this](double fraction, const std::string&) { progress.push_back(fraction); }});
+    }
 };
 
-std::string ReadBytes(const fs::path& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream out;
-    out << file.rdbuf();
-    return out.str();
+const Built& Shared() {
+    static const Built built;
+    return built;
 }
 
-int32_t IntAt(const std::string& bytes, size_t offset) {
-    int32_t v;
-    std::memcpy(&v, bytes.data() + offset, 4);
-    return v;
-}
-
-float FloatAt(const std::string& bytes, size_t offset) {
-    float v;
-    std::memcpy(&v, bytes.data() + offset, 4);
-    return v;
-}
-
-// A scene: a colour gradient under blurred noise, different for each seed.
-cv::Mat Scene(int seed, int rows = 96, int cols = 128) {
-    cv::Mat image(rows, cols, CV_8UC3);
-    cv::RNG rng(seed);
-    const cv::Vec3d from(rng.uniform(0, 256), rng.uniform(0, 256), rng.uniform(0, 256));
-    const cv::Vec3d to(rng.uniform(0, 256), rng.uniform(0, 256), rng.uniform(0, 256));
-    cv::Mat noise(rows, cols, CV_8UC3);
-    rng.fill(noise, cv::RNG::UNIFORM, 0, 256);
-    cv::GaussianBlur(noise, noise, cv::Size(0, 0), 1.0 + seed % 4);
-    for (int y = 0; y < rows; ++y)
-        for (int x = 0; x < cols; ++x) {
-            const double t = (seed % 2 ? x : y) / double(seed % 2 ? cols : rows);
-            for (int c = 0; c < 3; ++c)
-                image.at<cv::Vec3b>(y, x)[c] = cv::saturate_cast<uchar>(
-                    (1 - t) * from[c] + t * to[c] + 0.5 * (noise.at<cv::Vec3b>(y, x)[c] - 128.0));
-        }
-    return image;
+// Every file under dir, by relative path, with its bytes.
+std::map<std::string, std::string> Files(const fs::path& dir) {
+    std::map<std::string, std::string> files;
+    for (const auto& entry : fs::recursive_directory_iterator(dir))
+        if (entry.is_regular_file()) files[fs::relative(entry.path(), dir).string()] = ReadBytes(entry.path());
+    return files;
 }
 
 ColourStats LibraryStats(const cv::Mat& bgr8) {
-    cv::Mat lab;
-    lab.create(bgr8.rows, bgr8.cols, CV_32FC3);
+    cv::Mat lab(bgr8.rows, bgr8.cols, CV_32FC3);
     ConvertToLab(bgr8, lab);
     ColourStats stats{};
     ComputeChromaStats(lab, stats);
@@ -84,251 +76,122 @@ ColourStats LibraryStats(const cv::Mat& bgr8) {
     return stats;
 }
 
-// Style photos in several formats. Names sort as listed; the expected BGR
-// image of each (what the statistics must be computed on) is kept.
-struct StyleSet {
-    std::vector<cv::Mat> expected;
-
-    explicit StyleSet(const fs::path& dir) {
-        cv::Mat a = Scene(1);
-        cv::imwrite((dir / "a_plain.png").string(), a);
-        expected.push_back(a);
-
-        cv::Mat grey;
-        cv::cvtColor(Scene(2), grey, cv::COLOR_BGR2GRAY);
-        cv::imwrite((dir / "b_grey.png").string(), grey);
-        cv::Mat greyBgr;
-        cv::merge(std::vector<cv::Mat>{grey, grey, grey}, greyBgr);
-        expected.push_back(greyBgr);
-
-        // 16-bit samples reduce to the nearest 8-bit value: v16 = 257 v8 + 100.
-        cv::Mat c = Scene(3);
-        cv::Mat c16;
-        c.convertTo(c16, CV_16U, 257.0, 100.0);
-        cv::imwrite((dir / "c_deep.png").string(), c16);
-        expected.push_back(c);
-
-        // An alpha channel plays no part.
-        cv::Mat d = Scene(4);
-        cv::Mat alpha(d.size(), CV_8U);
-        cv::randu(alpha, 0, 256);
-        cv::Mat bgra;
-        std::vector<cv::Mat> planes;
-        cv::split(d, planes);
-        planes.push_back(alpha);
-        cv::merge(planes, bgra);
-        cv::imwrite((dir / "d_alpha.png").string(), bgra);
-        expected.push_back(d);
-
-        cv::Mat e = Scene(5);
-        cv::imwrite((dir / "e_tiff.TIF").string(), e);
-        expected.push_back(e);
-
-        cv::Mat f = Scene(6, 130, 90);
-        cv::imwrite((dir / "f_lossless.webp").string(), f, {cv::IMWRITE_WEBP_QUALITY, 101});
-        expected.push_back(cv::imread((dir / "f_lossless.webp").string(), cv::IMREAD_COLOR));
-
-        // Not a photo: ignored.
-        std::ofstream((dir / "notes.txt").string()) << "not a photo";
-    }
-};
-
-const std::vector<std::string>& ModelFiles() {
-    static const std::vector<std::string> files{
-        kClusterFileName, kStyleFileName, kScoresFileName, kDistanceFileName,
-        std::string(kNetworkFolder) + kNetworkDefinitionName, std::string(kNetworkFolder) + kNetworkWeightsName};
-    return files;
-}
-
-void Build(const fs::path& styles, const fs::path& out, int clusters = 0, const fs::path& content = {}) {
-    BuildModelOptions options;
-    options.stylesDir = styles.string();
-    options.contentDir = content.string();
-    options.outDir = out.string();
-    options.clusters = clusters;
-    BuildModel(options);
-}
-
-std::string BuildError(const BuildModelOptions& options) {
-    try {
-        BuildModel(options);
-    } catch (const std::runtime_error& e) {
-        return e.what();
-    }
-    return "no error";
-}
-
 }  // namespace
 
 TEST(ModelBuilder, SameInputsGiveSameBytesInTheDocumentedLayouts) {
-    TempDir styles("styles"), first("first"), second("second");
-    const StyleSet set(styles.path);
-    std::vector<double> fractions;
-    BuildModelOptions options;
-    options.stylesDir = styles.path.string();
-    options.outDir = first.path.string();
-    options.progress = [&](double fraction, const std::string&) { fractions.push_back(fraction); };
-    BuildModel(options);
-    Build(styles.path, second.path);
-
-    for (const std::string& name : ModelFiles()) {
-        const std::string a = ReadBytes(first.path / name);
-        ASSERT_FALSE(a.empty()) << name;
-        EXPECT_EQ(a, ReadBytes(second.path / name)) << name;
-    }
-    // Nothing else is left in the model folder (no staging leftovers).
-    int entries = 0;
-    for (const auto& entry : fs::recursive_directory_iterator(first.path)) entries += entry.is_regular_file();
-    EXPECT_EQ(entries, 6);
+    const Built& built = Shared();
+    const TempDir again;
+    Build(built.styles.path, again.path);
+    const std::map<std::string, std::string> files = Files(built.model.path);
+    EXPECT_EQ(files.size(), 6u);  // no staging leftovers
+    EXPECT_TRUE(files == Files(again.path));
 
     // Six photos, six content samples each; one cluster per ten samples.
-    const int styleCount = 6, clusters = 4;
-    const std::string centres = ReadBytes(first.path / kClusterFileName);
-    EXPECT_EQ(IntAt(centres, 0), clusters);
-    EXPECT_EQ(centres.size(), 4u + 2048u * clusters);
-    const std::string records = ReadBytes(first.path / kStyleFileName);
-    EXPECT_EQ(IntAt(records, 0), styleCount);
-    EXPECT_EQ(records.size(), 4u + 152u * styleCount);
-    const std::string scores = ReadBytes(first.path / kScoresFileName);
-    EXPECT_EQ(IntAt(scores, 0), clusters);
-    EXPECT_EQ(IntAt(scores, 4), styleCount);
-    EXPECT_EQ(scores.size(), 8u + 4u * clusters * styleCount);
-    const std::string distances = ReadBytes(first.path / kDistanceFileName);
-    EXPECT_EQ(IntAt(distances, 0), styleCount);
-    EXPECT_EQ(distances.size(), 4u + 4u * styleCount * (styleCount + 1) / 2);
-
-    ASSERT_FALSE(fractions.empty());
-    EXPECT_EQ(fractions.back(), 1.0);
-    for (size_t i = 1; i < fractions.size(); ++i) EXPECT_GE(fractions[i], fractions[i - 1]);
+    using Layout = std::tuple<const char*, std::vector<int32_t>, size_t>;  // file, header, size
+    for (const auto& [file, header, size] : std::vector<Layout>{{kClusterFileName, {4}, 4 + 2048 * 4},
+                                                                 {kStyleFileName, {6}, 4 + 152 * 6},
+                                                                 {kScoresFileName, {4, 6}, 8 + 4 * 4 * 6},
+                                                                 {kDistanceFileName, {6}, 4 + 4 * 21}}) {
+        const std::string bytes = ReadBytes(built.model.path / file);
+        EXPECT_EQ(bytes.size(), size) << file;
+        for (size_t i = 0; i < header.size(); ++i) EXPECT_EQ(At<int32_t>(bytes, 4 * i), header[i]) << file;
+    }
+    ASSERT_FALSE(built.progress.empty());
+    EXPECT_EQ(built.progress.back(), 1.0);
+    EXPECT_TRUE(std::is_sorted(built.progress.begin(), built.progress.end()));
 }
 
 TEST(ModelBuilder, RecordsAndDistancesComeFromEachPhotosColours) {
-    TempDir styles("styles"), out("out");
-    const StyleSet set(styles.path);
-    Build(styles.path, out.path);
-
+    const Built& built = Shared();
     // Records in file-name order, 38 words each: the library's statistics of
     // the photo as read (grey expanded, 16-bit reduced, alpha dropped).
-    const std::string records = ReadBytes(out.path / kStyleFileName);
-    std::vector<ColourStats> stored(set.expected.size());
-    for (size_t s = 0; s < set.expected.size(); ++s) {
-        const ColourStats expected = LibraryStats(set.expected[s]);
-        stored[s] = ColourStats{};
+    const std::string records = ReadBytes(built.model.path / kStyleFileName);
+    const size_t n = built.asRead.size();
+    std::vector<ColourStats> stored(n);
+    for (size_t s = 0; s < n; ++s) {
+        const ColourStats expected = LibraryStats(built.asRead[s]);
         std::memcpy(stored[s].data(), records.data() + 4 + 152 * s, 152);
         for (int w = 0; w < 38; ++w) EXPECT_EQ(stored[s].data()[w], expected.data()[w]) << "style " << s << " word " << w;
     }
-
     // Upper triangle with diagonal, row by row.
-    const std::string distances = ReadBytes(out.path / kDistanceFileName);
-    const int n = static_cast<int>(stored.size());
+    const std::string distances = ReadBytes(built.model.path / kDistanceFileName);
     size_t offset = 4;
-    for (int i = 0; i < n; ++i)
-        for (int j = i; j < n; ++j, offset += 4) {
-            const float expected = i == j ? 0.0f : static_cast<float>(StyleDistance(stored[i], stored[j]));
-            EXPECT_EQ(FloatAt(distances, offset), expected) << i << "," << j;
-        }
-    // The grey photo has no colour: it lies far from the others.
-    EXPECT_GT(std::sqrt(FloatAt(distances, 4 + 4 * 1)), 15.0f);
+    for (size_t i = 0; i < n; ++i)
+        for (size_t j = i; j < n; ++j, offset += 4)
+            EXPECT_EQ(At<float>(distances, offset), i == j ? 0.0f : float(StyleDistance(stored[i], stored[j])))
+                << i << "," << j;
 }
 
-TEST(ModelBuilder, StyleDistanceReadsInLabUnits) {
+TEST(StyleDistance, ReadsInLabUnits) {
     ColourStats a{};
     for (int i = 0; i < 32; ++i) a.lightness[i] = i / 31.0f;
     a.chromaSqrtCov[0] = a.chromaSqrtCov[3] = 10.0f;
-
-    ColourStats cast = a;  // a colour cast of 15 units: 9 in a*, 12 in b*
-    cast.chromaMean[0] += 9.0f;
+    ColourStats cast = a, vivid = a, brighter = a;
+    cast.chromaMean[0] += 9.0f;  // a colour cast of 15 units
     cast.chromaMean[1] += 12.0f;
-    EXPECT_NEAR(std::sqrt(StyleDistance(a, cast)), 15.0, 1e-5);
-
-    ColourStats vivid = a;  // chroma spread up by 15 in every direction
-    vivid.chromaSqrtCov[0] = vivid.chromaSqrtCov[3] = 25.0f;
-    EXPECT_NEAR(std::sqrt(StyleDistance(a, vivid)), 15.0, 1e-5);
-
-    ColourStats brighter = a;  // every tone 15 L* higher
-    for (float& l : brighter.lightness) l += 0.15f;
-    EXPECT_NEAR(std::sqrt(StyleDistance(a, brighter)), 15.0, 1e-4);
-
+    vivid.chromaSqrtCov[0] = vivid.chromaSqrtCov[3] = 25.0f;  // chroma spread up by 15
+    for (float& l : brighter.lightness) l += 0.15f;         // every tone 15 L* higher
+    for (const ColourStats* b : {&cast, &vivid, &brighter}) EXPECT_NEAR(std::sqrt(StyleDistance(a, *b)), 15.0, 1e-4);
     EXPECT_EQ(StyleDistance(a, a), 0.0);
     EXPECT_EQ(StyleDistance(a, cast), StyleDistance(cast, a));
 }
 
 TEST(ModelBuilder, NetworkLoadsAndEachStyleScoresBestInItsNearestCluster) {
-    TempDir styles("styles"), out("out");
-    const StyleSet set(styles.path);
-    Build(styles.path, out.path, 3);
-
-    const fs::path net = out.path / kNetworkFolder;
+    const Built& built = Shared();
+    const fs::path net = built.model.path / kNetworkFolder;
     auto network = FeatureNetwork::Load((net / kNetworkDefinitionName).string(), (net / kNetworkWeightsName).string());
     ASSERT_TRUE(network->hasMemoryDataInput());
-
-    const std::string centres = ReadBytes(out.path / kClusterFileName);
-    const std::string scores = ReadBytes(out.path / kScoresFileName);
-    const int clusters = IntAt(centres, 0);
-    const int styleCount = IntAt(scores, 4);
-    ASSERT_EQ(clusters, 3);
-    const std::vector<std::string> photos = ListPhotos(styles.path.string());
-    ASSERT_EQ(static_cast<int>(photos.size()), styleCount);
-    for (int s = 0; s < styleCount; ++s) {
-        cv::Mat canvas;
+    std::string centres = ReadBytes(built.model.path / kClusterFileName);
+    std::string scores = ReadBytes(built.model.path / kScoresFileName);
+    const int clusters = At<int32_t>(centres, 0), styles = At<int32_t>(scores, 4);
+    const cv::Mat centreRows(clusters, 512, CV_32F, &centres[4]), scoreRows(clusters, styles, CV_32F, &scores[8]);
+    const std::vector<std::string> photos = ListPhotos(built.styles.path.string());
+    ASSERT_EQ(int(photos.size()), styles);
+    for (int s = 0; s < styles; ++s) {
+        cv::Mat canvas, distances;
         ASSERT_TRUE(PrepareNetworkImage(ReadPhoto(photos[s]), canvas, kNetworkImageSize, kNetworkInputSize));
         const std::vector<float> feature = network->Forward(canvas);
         ASSERT_EQ(feature.size(), 512u);
-        int nearest = 0, best = 0;
-        double nearestDistance = 1e300;
-        for (int k = 0; k < clusters; ++k) {
-            double d = 0.0;
-            for (int i = 0; i < 512; ++i) d += std::pow(feature[i] - FloatAt(centres, 4 + 2048 * k + 4 * i), 2);
-            if (d < nearestDistance) nearestDistance = d, nearest = k;
-            if (FloatAt(scores, 8 + 4 * (k * styleCount + s)) > FloatAt(scores, 8 + 4 * (best * styleCount + s))) best = k;
-        }
-        EXPECT_EQ(best, nearest) << photos[s];
+        for (int k = 0; k < clusters; ++k) distances.push_back(cv::norm(centreRows.row(k), cv::Mat(feature).t()));
+        cv::Point nearest, best;
+        cv::minMaxLoc(distances, nullptr, nullptr, &nearest);
+        cv::minMaxLoc(scoreRows.col(s), nullptr, nullptr, nullptr, &best);
+        EXPECT_EQ(best.y, nearest.y) << photos[s];
     }
 }
 
 TEST(ModelBuilder, ContentFolderGivesTheClusterSamples) {
-    TempDir styles("styles"), content("content"), out("out");
-    const StyleSet set(styles.path);
+    const TempDir content, out;
     for (int i = 0; i < 5; ++i) cv::imwrite((content.path / ("c" + std::to_string(i) + ".jpg")).string(), Scene(20 + i));
-    Build(styles.path, out.path, 0, content.path);
-    // Five content photos, taken as they are: one cluster by default.
-    EXPECT_EQ(IntAt(ReadBytes(out.path / kClusterFileName), 0), 1);
-    Build(styles.path, out.path, 5, content.path);
-    EXPECT_EQ(IntAt(ReadBytes(out.path / kClusterFileName), 0), 5);
+    // Five content photos, taken as they are: one cluster by default, five at most.
+    for (int clusters : {0, 5}) {
+        Build(Shared().styles.path, out.path, clusters, content.path);
+        EXPECT_EQ(At<int32_t>(ReadBytes(out.path / kClusterFileName), 0), std::max(clusters, 1));
+    }
 }
 
 TEST(ModelBuilder, FailuresSayWhatIsWrongAndLeaveTheModelAlone) {
-    TempDir styles("styles"), out("out"), empty("empty");
-    const StyleSet set(styles.path);
-    Build(styles.path, out.path);
-    std::vector<std::string> before;
-    for (const std::string& name : ModelFiles()) before.push_back(ReadBytes(out.path / name));
-
-    BuildModelOptions options;
-    options.outDir = out.path.string();
-
-    options.stylesDir = empty.path.string();
-    EXPECT_NE(BuildError(options).find("need at least 2 style photos in " + empty.path.string() + ", found 0"),
-              std::string::npos);
-
-    options.stylesDir = (empty.path / "missing").string();
-    EXPECT_NE(BuildError(options).find("is not a readable folder"), std::string::npos);
-
-    options.stylesDir = styles.path.string();
-    options.clusters = 1000;
-    EXPECT_NE(BuildError(options).find("cannot make 1000 clusters from 36 content samples"), std::string::npos);
-    options.clusters = 0;
-
-    std::ofstream((styles.path / "zz_broken.jpg").string()) << "these bytes are no JPEG";
-    EXPECT_EQ(BuildError(options), "cannot read the photo " + (styles.path / "zz_broken.jpg").string());
-
+    const Built& built = Shared();
+    const std::map<std::string, std::string> before = Files(built.model.path);
+    const TempDir empty, broken;
+    fs::copy(built.styles.path, broken.path);
+    std::ofstream(broken.path / "zz_broken.jpg") << "these bytes are no JPEG";
+    const std::string model = built.model.path.string(), good = built.styles.path.string();
+    const std::string underFile = (built.model.path / kClusterFileName / "model").string();
+    using Case = std::tuple<std::string, std::string, int, std::string>;  // styles, model, clusters, message
+    for (const auto& [styles, out, clusters, message] : std::vector<Case>{
+             {empty.path.string(), model, 0, "need at least 2 style photos in " + empty.path.string() + ", found 0"},
+             {(empty.path / "missing").string(), model, 0, "is not a readable folder"},
+             {good, model, 1000, "cannot make 1000 clusters from 36 content samples"},
+             {broken.path.string(), model, 0, "cannot read the photo " + (broken.path / "zz_broken.jpg").string()},
+             {good, underFile, 0, "cannot create the model folder " + underFile}}) {
+        try {
+            Build(styles, out, clusters);
+            ADD_FAILURE() << "built despite: " << message;
+        } catch (const std::runtime_error& e) {
+            EXPECT_NE(std::string(e.what()).find(message), std::string::npos) << e.what();
+        }
+    }
     // The failed builds left the earlier model as it was, and nothing else.
-    for (size_t i = 0; i < before.size(); ++i) EXPECT_EQ(ReadBytes(out.path / ModelFiles()[i]), before[i]);
-    int entries = 0;
-    for (const auto& entry : fs::recursive_directory_iterator(out.path)) entries += entry.is_regular_file();
-    EXPECT_EQ(entries, 6);
-
-    fs::remove(styles.path / "zz_broken.jpg");
-    options.outDir = (out.path / kClusterFileName / "model").string();  // under a regular file
-    EXPECT_EQ(BuildError(options), "cannot create the model folder " + options.outDir);
+    EXPECT_TRUE(Files(built.model.path) == before);
 }
