@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 
 #include <cstring>
+#include <functional>
+#include <memory>
 
 #include "model/Engine.h"
 #include "model/StyleDatabase.h"
@@ -11,237 +13,120 @@ namespace {
 
 using fixtures::FixtureOptions;
 using fixtures::ModelFixture;
+using fixtures::RandomDatabase;
 
-// The three readers in the loader's order, without the network.
-ReadResult ReadDatabase(Engine& engine, const std::string& modelDir) {
-    ReadClusterCentres(engine, modelDir);
-    ReadStyleRecords(engine, DataFilePath(modelDir, kStyleFileName));
-    return ReadScoresAndDistances(engine, modelDir);
-}
-
-FixtureOptions DataOnly(int clusters, int styles) {
-    FixtureOptions options = fixtures::RandomDatabase(clusters, styles, 7);
-    options.network.files = fixtures::NetworkOptions::Files::None;
-    return options;
-}
-
-TEST(StyleDatabase, FileNamesAndJoin) {
-    EXPECT_STREQ(kClusterFileName, "semantic_cluster_1000.dat");
-    EXPECT_STREQ(kStyleFileName, "styledb_style_1500.dat");
-    EXPECT_STREQ(kScoresFileName, "semantic_style_scores_1000_1500_1.dat");
-    EXPECT_STREQ(kDistanceFileName, "styledb_fdist_1500.dat");
-    EXPECT_EQ(DataFilePath("./model/", kClusterFileName), "./model//semantic_cluster_1000.dat");
-    EXPECT_EQ(DataFilePath("C:/data/model", kStyleFileName), "C:/data/model/styledb_style_1500.dat");
-}
-
-TEST(StyleDatabase, ReadsEveryTableInFileOrder) {
-    const FixtureOptions options = DataOnly(3, 4);
+// The three readers in the loader's order, without the network; damage may
+// alter the written files first. Returns the first failing reader's result.
+std::unique_ptr<Engine> Read(const FixtureOptions& options, ReadResult* result,
+                             const std::function<void(const ModelFixture&)>& damage = nullptr) {
     const ModelFixture model(options);
-    Engine engine;
-    EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-
-    ASSERT_EQ(engine.clusterCount, 3);
-    ASSERT_EQ(engine.clusterCentres.size(), 3u);
-    for (size_t k = 0; k < 3; ++k) EXPECT_EQ(engine.clusterCentres[k], options.centres[k]) << k;
-
-    ASSERT_EQ(engine.styleCount, 4);
-    ASSERT_EQ(engine.styleRecords.size(), 4u);
-    for (size_t s = 0; s < 4; ++s) {
-        EXPECT_EQ(std::memcmp(engine.styleRecords[s].data(), options.styles[s].data(), 38 * sizeof(float)), 0) << s;
-        EXPECT_EQ(engine.styleRecords[s].lightnessLow, 0.0f);
-        EXPECT_EQ(engine.styleRecords[s].lightnessHigh, 0.0f);
-    }
-
-    EXPECT_EQ(engine.scoreColumns, 4);
-    ASSERT_EQ(engine.rankedStyles.size(), 3u);
-    for (size_t r = 0; r < 3; ++r) {
-        const std::vector<float>& scores = options.scores[r];
-        const std::vector<int32_t>& ranked = engine.rankedStyles[r];
-        ASSERT_EQ(ranked.size(), 4u);
-        EXPECT_GT(scores[static_cast<size_t>(ranked[0])], scores[static_cast<size_t>(ranked[1])]);
-        for (size_t c = 0; c < 4; ++c) {
-            if (c != static_cast<size_t>(ranked[0]) && c != static_cast<size_t>(ranked[1])) {
-                EXPECT_GT(scores[static_cast<size_t>(ranked[1])], scores[c]) << r << " " << c;
-            }
-        }
-        EXPECT_EQ(ranked[2], -1);
-        EXPECT_EQ(ranked[3], -1);
-    }
-    EXPECT_EQ(engine.styleDistances, options.distances);
+    if (damage) damage(model);
+    auto engine = std::make_unique<Engine>();
+    ReadClusterCentres(*engine, model.modelDir());
+    *result = ReadStyleRecords(*engine, model.DataFile(kStyleFileName));
+    const ReadResult scores = ReadScoresAndDistances(*engine, model.modelDir());
+    if (*result == ReadResult::Ok) *result = scores;
+    return engine;
 }
 
-TEST(StyleDatabase, OddColumnCountKeepsTheBetterHalfRoundedDown) {
-    FixtureOptions options = DataOnly(2, 5);
+TEST(StyleDatabase, ReadsTablesAndKeepsTheBetterHalfOfEachRanking) {
+    FixtureOptions options = RandomDatabase(2, 5);
     options.scores = {{0.1f, 0.9f, 0.5f, 0.7f, 0.3f}, {5.0f, -1.0f, 2.0f, 8.0f, 0.0f}};
-    const ModelFixture model(options);
-    Engine engine;
-    ASSERT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-    ASSERT_EQ(engine.rankedStyles.size(), 2u);
-    EXPECT_EQ(engine.rankedStyles[0], (std::vector<int32_t>{1, 3, -1, -1, -1}));
-    EXPECT_EQ(engine.rankedStyles[1], (std::vector<int32_t>{3, 0, -1, -1, -1}));
+    ReadResult result;
+    const auto engine = Read(options, &result);
+    ASSERT_EQ(result, ReadResult::Ok);
+    EXPECT_EQ(engine->clusterCentres, options.centres);
+    ASSERT_EQ(engine->styleRecords.size(), 5u);  // the percentile words, not in the file, stay zero
+    EXPECT_EQ(std::memcmp(engine->styleRecords.data(), options.styles.data(), 5 * sizeof(ColourStats)), 0);
+    // C = 5 keeps 2 by decreasing score; the other 3 hold -1.
+    EXPECT_EQ(engine->rankedStyles, (std::vector<std::vector<int32_t>>{{1, 3, -1, -1, -1}, {3, 0, -1, -1, -1}}));
+    EXPECT_EQ(engine->styleDistances, options.distances);  // written as the upper triangle only
 
-    const ModelFixture oneColumn(DataOnly(2, 1));
-    Engine oneColumnEngine;
-    ASSERT_EQ(ReadDatabase(oneColumnEngine, oneColumn.modelDir()), ReadResult::Ok);
-    EXPECT_EQ(oneColumnEngine.rankedStyles, (std::vector<std::vector<int32_t>>{{-1}, {-1}}));
+    const auto oneColumn = Read(RandomDatabase(2, 1), &result);
+    EXPECT_EQ(oneColumn->rankedStyles, (std::vector<std::vector<int32_t>>{{-1}, {-1}}));
 }
 
-TEST(StyleDatabase, TransposedScoresAreRejectedUnlessSquare) {
-    FixtureOptions options = DataOnly(2, 3);
-    options.transposeScores = true;
-    const ModelFixture model(options);
-    Engine engine;
-    EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::SizeMismatch);
-    EXPECT_EQ(engine.scoreColumns, 2);  // stored as read, even when rejected
-    EXPECT_TRUE(engine.rankedStyles.empty());
-    EXPECT_TRUE(engine.styleDistances.empty());  // not read after a rejected scores file
+struct ReaderCase {
+    const char* name;
+    std::function<void(FixtureOptions&)> change;
+    ReadResult result;
+    size_t centres, styles, ranked, distances;
+    int32_t scoreColumns;
+};
 
-    FixtureOptions square = DataOnly(3, 3);
-    square.transposeScores = true;
-    const ModelFixture squareModel(square);
-    Engine squareEngine;
-    EXPECT_EQ(ReadDatabase(squareEngine, squareModel.modelDir()), ReadResult::Ok);
-    EXPECT_EQ(squareEngine.rankedStyles.size(), 3u);
-}
-
-TEST(StyleDatabase, DistancesMirrorTheUpperTriangle) {
-    FixtureOptions options = DataOnly(1, 3);
-    options.writeDistances = false;
-    const ModelFixture model(options);
-    fixtures::WriteDistanceFile(model.DataFile(kDistanceFileName), 3, {1.0f, 2.0f, 3.0f, 4.0f, 5.0f, 6.0f});
-    Engine engine;
-    ASSERT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-    const std::vector<std::vector<float>> expected = {{1, 2, 3}, {2, 4, 5}, {3, 5, 6}};
-    EXPECT_EQ(engine.styleDistances, expected);
-}
-
-TEST(StyleDatabase, DistanceCountMismatchKeepsTheRanking) {
-    FixtureOptions options = DataOnly(2, 3);
-    options.distanceCount = 2;
-    const ModelFixture model(options);
-    Engine engine;
-    EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::SizeMismatch);
-    EXPECT_TRUE(engine.styleDistances.empty());
-    EXPECT_EQ(engine.rankedStyles.size(), 2u);
-}
-
-TEST(StyleDatabase, ZeroClustersGiveEmptyTables) {
-    const ModelFixture model(DataOnly(0, 3));
-    Engine engine;
-    EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-    EXPECT_EQ(engine.clusterCount, 0);
-    EXPECT_TRUE(engine.clusterCentres.empty());
-    EXPECT_TRUE(engine.rankedStyles.empty());
-    EXPECT_EQ(engine.styleDistances.size(), 3u);
-}
-
-TEST(StyleDatabase, MissingFilesReportCannotOpen) {
-    {
-        FixtureOptions options = DataOnly(2, 3);
-        options.writeClusters = false;
-        const ModelFixture model(options);
-        Engine engine;
-        // The cluster count stays 0, so two score rows no longer fit.
-        EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::SizeMismatch);
-        EXPECT_EQ(engine.clusterCount, 0);
-        EXPECT_TRUE(engine.clusterCentres.empty());
+TEST(StyleDatabase, MissingOrMismatchedFilesLeaveTablesEmpty) {
+    const std::vector<ReaderCase> cases = {
+        {"consistent", nullptr, ReadResult::Ok, 2, 3, 2, 3, 3},
+        {"no clusters", [](FixtureOptions& o) { o.writeClusters = false; }, ReadResult::SizeMismatch, 0, 3, 0, 0, 3},
+        {"no styles", [](FixtureOptions& o) { o.writeStyles = false; }, ReadResult::CannotOpen, 2, 0, 0, 0, 3},
+        {"no scores", [](FixtureOptions& o) { o.writeScores = false; }, ReadResult::CannotOpen, 2, 3, 0, 0, 0},
+        {"no distances", [](FixtureOptions& o) { o.writeDistances = false; }, ReadResult::CannotOpen, 2, 3, 2, 0, 3},
+        {"distance count", [](FixtureOptions& o) { o.distanceCount = 2; }, ReadResult::SizeMismatch, 2, 3, 2, 0, 3},
+        // Swapped R and C are rejected (the columns stored as read) unless square.
+        {"transposed", [](FixtureOptions& o) { o.transposeScores = true; }, ReadResult::SizeMismatch, 2, 3, 0, 0, 2},
+        {"transposed square", [](FixtureOptions& o) { o = RandomDatabase(3, 3), o.transposeScores = true; },
+         ReadResult::Ok, 3, 3, 3, 3, 3},
+        {"no clusters at all", [](FixtureOptions& o) { o = RandomDatabase(0, 3); }, ReadResult::Ok, 0, 3, 0, 3, 3},
+        {"negative table counts", [](FixtureOptions& o) { o.clusterCount = -5, o.styleCount = -1; },
+         ReadResult::SizeMismatch, 0, 0, 0, 0, 3},
+        {"negative score counts", [](FixtureOptions& o) { o.scoreRows = -2, o.scoreColumns = -3; },
+         ReadResult::SizeMismatch, 2, 3, 0, 0, -3},
+    };
+    for (const ReaderCase& c : cases) {
+        SCOPED_TRACE(c.name);
+        FixtureOptions options = RandomDatabase(2, 3);
+        if (c.change) c.change(options);
+        ReadResult result;
+        const auto engine = Read(options, &result);
+        EXPECT_EQ(result, c.result);
+        EXPECT_EQ(engine->clusterCentres.size(), c.centres);
+        EXPECT_EQ(engine->clusterCount, static_cast<int32_t>(c.centres));
+        EXPECT_EQ(engine->styleRecords.size(), c.styles);
+        EXPECT_EQ(engine->styleCount, static_cast<int32_t>(c.styles));
+        EXPECT_EQ(engine->rankedStyles.size(), c.ranked);
+        EXPECT_EQ(engine->styleDistances.size(), c.distances);
+        EXPECT_EQ(engine->scoreColumns, c.scoreColumns);
     }
-    {
-        FixtureOptions options = DataOnly(2, 3);
-        options.writeStyles = false;
-        const ModelFixture model(options);
-        Engine engine;
-        engine.styleCount = 9;
-        EXPECT_EQ(ReadStyleRecords(engine, model.DataFile(kStyleFileName)), ReadResult::CannotOpen);
-        EXPECT_EQ(engine.styleCount, 9);
-    }
-    {
-        FixtureOptions options = DataOnly(2, 3);
-        options.writeScores = false;
-        const ModelFixture model(options);
-        Engine engine;
-        EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::CannotOpen);
-        EXPECT_TRUE(engine.rankedStyles.empty());
-        EXPECT_TRUE(engine.styleDistances.empty());  // present, but not read
-        EXPECT_EQ(engine.scoreColumns, 0);
-    }
-    {
-        FixtureOptions options = DataOnly(2, 3);
-        options.writeDistances = false;
-        const ModelFixture model(options);
-        Engine engine;
-        EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::CannotOpen);
-        EXPECT_EQ(engine.rankedStyles.size(), 2u);
-        EXPECT_TRUE(engine.styleDistances.empty());
-    }
+}
+
+// The table's first bytes, then zeros.
+template <typename Table>
+Table KeepBytes(Table table, size_t bytes) {
+    std::memset(reinterpret_cast<char*>(table.data()) + bytes, 0, table.size() * sizeof table[0] - bytes);
+    return table;
 }
 
 TEST(StyleDatabase, ShortFilesLeaveZeroTails) {
-    FixtureOptions options = DataOnly(2, 3);
-    options.writeDistances = false;
-    const ModelFixture model(options);
-    // Cut each file inside its second entry (mid-value, to check byte-wise reads).
-    fixtures::TruncateFile(model.DataFile(kClusterFileName), 4 + 2048 + 6);
-    fixtures::TruncateFile(model.DataFile(kStyleFileName), 4 + 152 + 10);
-    fixtures::TruncateFile(model.DataFile(kScoresFileName), 8 + 4 * 4);
-    fixtures::WriteDistanceFile(model.DataFile(kDistanceFileName), 3, {1.0f, 2.0f, 3.0f, 4.0f});
-
-    Engine engine;
-    ASSERT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::Ok);
-    ASSERT_EQ(engine.clusterCentres.size(), 2u);
-    EXPECT_EQ(engine.clusterCentres[0], options.centres[0]);
-    EXPECT_EQ(engine.clusterCentres[1][0], options.centres[1][0]);
-    float partial = 0.0f;  // the first two bytes from the file, the rest zero
-    std::memcpy(&partial, &options.centres[1][1], 2);
-    EXPECT_EQ(std::memcmp(&engine.clusterCentres[1][1], &partial, sizeof partial), 0);
-    for (size_t i = 2; i < 512; ++i) ASSERT_EQ(engine.clusterCentres[1][i], 0.0f) << i;
-
-    ASSERT_EQ(engine.styleRecords.size(), 3u);
-    EXPECT_EQ(engine.styleRecords[1].chromaMean[0], options.styles[1].chromaMean[0]);
-    EXPECT_EQ(engine.styleRecords[1].chromaMean[1], options.styles[1].chromaMean[1]);
-    EXPECT_EQ(engine.styleRecords[1].chromaSqrtCov[1], 0.0f);
-    for (float sample : engine.styleRecords[2].lightness) EXPECT_EQ(sample, 0.0f);
-
-    // Row 0 is read whole; row 1 has only its first value, the rest score 0.
-    ASSERT_EQ(engine.rankedStyles.size(), 2u);
+    const FixtureOptions options = RandomDatabase(2, 3);
+    ReadResult result;
+    // Each file cut inside its second entry, mid-value to check byte-wise reads.
+    const auto engine = Read(options, &result, [](const ModelFixture& model) {
+        fixtures::TruncateFile(model.DataFile(kClusterFileName), 4 + 2048 + 6);
+        fixtures::TruncateFile(model.DataFile(kStyleFileName), 4 + 152 + 10);
+        fixtures::TruncateFile(model.DataFile(kScoresFileName), 8 + 4 * 4);
+        fixtures::WriteDataFile(model.DataFile(kDistanceFileName), {3}, {1, 2, 3, 4});
+    });
+    ASSERT_EQ(result, ReadResult::Ok);
+    ASSERT_EQ(engine->clusterCentres.size(), 2u);
+    ASSERT_EQ(engine->styleRecords.size(), 3u);
+    const auto centres = KeepBytes(options.centres, 2048 + 6);
+    EXPECT_EQ(std::memcmp(engine->clusterCentres.data(), centres.data(), 2 * sizeof(ClusterCentre)), 0);
+    const auto styles = KeepBytes(options.styles, sizeof(ColourStats) + 10);  // the percentile words are zero
+    EXPECT_EQ(std::memcmp(engine->styleRecords.data(), styles.data(), 3 * sizeof(ColourStats)), 0);
+    // Row 1 has only its first (positive) score; the rest score 0.
     ASSERT_GT(options.scores[1][0], 0.0f);
-    EXPECT_EQ(engine.rankedStyles[1], (std::vector<int32_t>{0, -1, -1}));
-
-    const std::vector<std::vector<float>> distances = {{1, 2, 3}, {2, 4, 0}, {3, 0, 0}};
-    EXPECT_EQ(engine.styleDistances, distances);
-}
-
-TEST(StyleDatabase, NegativeCountsReadAsEmpty) {
-    FixtureOptions options = DataOnly(2, 3);
-    options.clusterCount = -5;
-    options.styleCount = -1;
-    const ModelFixture model(options);
-    Engine engine;
-    EXPECT_EQ(ReadDatabase(engine, model.modelDir()), ReadResult::SizeMismatch);
-    EXPECT_EQ(engine.clusterCount, 0);
-    EXPECT_TRUE(engine.clusterCentres.empty());
-    EXPECT_EQ(engine.styleCount, 0);
-    EXPECT_TRUE(engine.styleRecords.empty());
-
-    FixtureOptions negativeScores = DataOnly(2, 3);
-    negativeScores.scoreRows = -2;
-    negativeScores.scoreColumns = -3;
-    const ModelFixture scoresModel(negativeScores);
-    Engine scoresEngine;
-    EXPECT_EQ(ReadDatabase(scoresEngine, scoresModel.modelDir()), ReadResult::SizeMismatch);
-    EXPECT_TRUE(scoresEngine.rankedStyles.empty());
+    EXPECT_EQ(engine->rankedStyles.at(1), (std::vector<int32_t>{0, -1, -1}));
+    // The upper triangle mirrored: (a b c)(b d e)(c e f), its missing tail zero.
+    EXPECT_EQ(engine->styleDistances, (std::vector<std::vector<float>>{{1, 2, 3}, {2, 4, 0}, {3, 0, 0}}));
 }
 
 TEST(StyleDatabase, OverflowingScoreCountsAreRejectedWithoutAllocating) {
-    // Counts that match the engine but whose product leaves int32: no buffer
-    // of that size may be attempted.
-    FixtureOptions options = DataOnly(0, 0);
-    options.scoreRows = 70000;
-    options.scoreColumns = 70000;
+    // Counts that match the engine but whose product leaves int32.
+    FixtureOptions options = RandomDatabase(0, 0);
+    options.scoreRows = options.scoreColumns = 70000;
     const ModelFixture model(options);
     Engine engine;
-    engine.clusterCount = 70000;
-    engine.styleCount = 70000;
+    engine.clusterCount = engine.styleCount = 70000;
     EXPECT_EQ(ReadScoresAndDistances(engine, model.modelDir()), ReadResult::SizeMismatch);
     EXPECT_TRUE(engine.rankedStyles.empty());
 }

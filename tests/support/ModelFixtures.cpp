@@ -5,7 +5,6 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <random>
@@ -20,8 +19,12 @@ namespace fixtures {
 
 namespace {
 
-constexpr const char* kMeanFileName = "mean.binaryproto";
-constexpr int kChannels = 3;
+constexpr int kSize = 256;  // the fixture network's input height and width
+
+template <typename T>
+void Append(std::string& bytes, const std::vector<T>& values) {
+    bytes.append(reinterpret_cast<const char*>(values.data()), values.size() * sizeof(T));
+}
 
 std::string FloatText(float value) {
     char text[32];
@@ -29,21 +32,34 @@ std::string FloatText(float value) {
     return text;
 }
 
+float Weight(int k, int c) { return static_cast<float>(std::sin(0.7 * k + 2.1 * c)); }
+float Bias(int k) { return static_cast<float>(0.1 * std::cos(1.3 * k)); }
+
+std::string FixtureDefinition(const NetworkOptions& options) {
+    std::ostringstream text;
+    text << "name: \"vora_fixture\"\n";
+    if (options.memoryData) {
+        text << "layer { name: \"data\" type: \"MemoryData\" top: \"data\" top: \"label\"\n"
+             << "  memory_data_param { batch_size: 1 channels: 3 height: " << kSize << " width: " << kSize << " }\n"
+             << "  transform_param {\n";
+        if (options.cropSize > 0) text << "    crop_size: " << options.cropSize << "\n";
+        if (options.meanFile) text << "    mean_file: \"mean.binaryproto\"\n";
+        for (float mean : options.meanFile ? std::vector<float>() : options.meanValues)
+            text << "    mean_value: " << FloatText(mean) << "\n";
+        if (options.writeScale) text << "    scale: " << FloatText(options.scale) << "\n";
+        text << "  }\n}\n";
+    } else {
+        text << "input: \"data\"\ninput_shape { dim: 1 dim: 3 dim: " << kSize << " dim: " << kSize << " }\n";
+    }
+    text << "layer { name: \"pool\" type: \"Pooling\" bottom: \"data\" top: \"pool\"\n"
+         << "  pooling_param { pool: AVE global_pooling: true } }\n"
+         << "layer { name: \"fc512\" type: \"InnerProduct\" bottom: \"pool\" top: \"fc512\"\n"
+         << "  inner_product_param { num_output: " << options.outputs << " } }\n";
+    if (options.reluOnOutput) text << "layer { name: \"relu\" type: \"ReLU\" bottom: \"fc512\" top: \"fc512\" }\n";
+    return text.str();
+}
+
 }  // namespace
-
-// ---- Bytes and files ------------------------------------------------------
-
-std::string Int32Bytes(const std::vector<int32_t>& values) {
-    std::string bytes(values.size() * sizeof(int32_t), '\0');
-    if (!values.empty()) std::memcpy(&bytes[0], values.data(), bytes.size());
-    return bytes;
-}
-
-std::string FloatBytes(const std::vector<float>& values) {
-    std::string bytes(values.size() * sizeof(float), '\0');
-    if (!values.empty()) std::memcpy(&bytes[0], values.data(), bytes.size());
-    return bytes;
-}
 
 void WriteBytes(const std::string& path, const std::string& bytes) {
     std::ofstream file(path, std::ios::binary | std::ios::trunc);
@@ -51,125 +67,23 @@ void WriteBytes(const std::string& path, const std::string& bytes) {
     if (!file.flush()) throw std::runtime_error("cannot write " + path);
 }
 
-std::string ReadBytes(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    if (!file) throw std::runtime_error("cannot read " + path);
-    std::ostringstream bytes;
-    bytes << file.rdbuf();
-    return bytes.str();
-}
-
 void TruncateFile(const std::string& path, size_t size) { std::filesystem::resize_file(path, size); }
 
-// ---- The four data files ---------------------------------------------------
-
-void WriteClusterFile(const std::string& path, const std::vector<ClusterCentre>& centres,
-                      std::optional<int32_t> count) {
-    std::string bytes = Int32Bytes({count.value_or(static_cast<int32_t>(centres.size()))});
-    for (const ClusterCentre& centre : centres) bytes += FloatBytes(std::vector<float>(centre.begin(), centre.end()));
+void WriteDataFile(const std::string& path, const std::vector<int32_t>& header, const std::vector<float>& values) {
+    std::string bytes;
+    Append(bytes, header);
+    Append(bytes, values);
     WriteBytes(path, bytes);
 }
 
-void WriteStyleFile(const std::string& path, const std::vector<ColourStats>& styles, std::optional<int32_t> count) {
-    std::string bytes = Int32Bytes({count.value_or(static_cast<int32_t>(styles.size()))});
-    for (const ColourStats& style : styles) bytes += FloatBytes(std::vector<float>(style.data(), style.data() + 38));
-    WriteBytes(path, bytes);
-}
-
-void WriteScoresFile(const std::string& path, const std::vector<std::vector<float>>& scores,
-                     std::optional<int32_t> rows, std::optional<int32_t> columns, bool transposed) {
-    const int32_t r = rows.value_or(static_cast<int32_t>(scores.size()));
-    const int32_t c = columns.value_or(scores.empty() ? 0 : static_cast<int32_t>(scores[0].size()));
-    std::vector<float> values;
-    if (transposed) {
-        const size_t width = scores.empty() ? 0 : scores[0].size();
-        for (size_t col = 0; col < width; ++col)
-            for (const std::vector<float>& row : scores) values.push_back(row.at(col));
-    } else {
-        for (const std::vector<float>& row : scores) values.insert(values.end(), row.begin(), row.end());
-    }
-    WriteBytes(path, Int32Bytes(transposed ? std::vector<int32_t>{c, r} : std::vector<int32_t>{r, c}) + FloatBytes(values));
-}
-
-void WriteDistanceFile(const std::string& path, int32_t count, const std::vector<float>& upperTriangle) {
-    WriteBytes(path, Int32Bytes({count}) + FloatBytes(upperTriangle));
-}
-
-std::vector<float> UpperTriangle(const std::vector<std::vector<float>>& matrix) {
-    std::vector<float> values;
-    for (size_t i = 0; i < matrix.size(); ++i)
-        for (size_t j = i; j < matrix[i].size(); ++j) values.push_back(matrix[i][j]);
-    return values;
-}
-
-// ---- The fixture network ---------------------------------------------------
-
-std::vector<float> DefaultWeights(int outputs) {
-    std::vector<float> weights;
-    for (int k = 0; k < outputs; ++k)
-        for (int c = 0; c < kChannels; ++c) weights.push_back(static_cast<float>(std::sin(0.7 * k + 2.1 * c)));
-    return weights;
-}
-
-std::vector<float> DefaultBias(int outputs) {
-    std::vector<float> bias;
-    for (int k = 0; k < outputs; ++k) bias.push_back(static_cast<float>(0.1 * std::cos(1.3 * k)));
-    return bias;
-}
-
-cv::Mat FixtureMeanBlob(const NetworkOptions& options) {
-    if (!options.meanBlob.empty()) return options.meanBlob;
-    const int sizes[3] = {kChannels, options.height, options.width};
+cv::Mat GradientMean(int height, int width) {
+    const int sizes[3] = {3, height, width};
     cv::Mat mean(3, sizes, CV_32F);
-    for (int c = 0; c < kChannels; ++c)
-        for (int y = 0; y < options.height; ++y)
-            for (int x = 0; x < options.width; ++x)
+    for (int c = 0; c < 3; ++c)
+        for (int y = 0; y < height; ++y)
+            for (int x = 0; x < width; ++x)
                 mean.ptr<float>(c, y)[x] = 90.0f + static_cast<float>((37 * c + y + 2 * x) % 61) * 0.5f;
     return mean;
-}
-
-std::string FixtureDefinition(const NetworkOptions& options) {
-    std::ostringstream text;
-    text << "name: \"vora_fixture\"\n";
-    if (options.memoryData) {
-        text << "layer {\n  name: \"data\"\n  type: \"MemoryData\"\n  top: \"data\"\n  top: \"label\"\n"
-             << "  memory_data_param {\n    batch_size: 1\n    channels: " << kChannels << "\n    height: "
-             << options.height << "\n    width: " << options.width << "\n  }\n  transform_param {\n";
-        if (options.cropSize > 0) text << "    crop_size: " << options.cropSize << "\n";
-        if (options.meanFile) {
-            text << "    mean_file: \"" << kMeanFileName << "\"\n";
-        } else {
-            for (float mean : options.meanValues) text << "    mean_value: " << FloatText(mean) << "\n";
-        }
-        if (options.writeScale) text << "    scale: " << FloatText(options.scale) << "\n";
-        text << "  }\n}\n";
-    } else {
-        text << "input: \"data\"\ninput_shape {\n  dim: 1\n  dim: " << kChannels << "\n  dim: " << options.height
-             << "\n  dim: " << options.width << "\n}\n";
-    }
-    text << "layer {\n  name: \"pool\"\n  type: \"Pooling\"\n  bottom: \"data\"\n  top: \"pool\"\n"
-         << "  pooling_param {\n    pool: AVE\n    global_pooling: true\n  }\n}\n"
-         << "layer {\n  name: \"fc512\"\n  type: \"InnerProduct\"\n  bottom: \"pool\"\n  top: \"fc512\"\n"
-         << "  inner_product_param {\n    num_output: " << options.outputs << "\n  }\n}\n";
-    if (options.reluOnOutput)
-        text << "layer {\n  name: \"relu\"\n  type: \"ReLU\"\n  bottom: \"fc512\"\n  top: \"fc512\"\n}\n";
-    return text.str();
-}
-
-std::vector<WeightsLayer> FixtureWeights(const NetworkOptions& options) {
-    WeightsLayer fc;
-    fc.name = "fc512";
-    fc.type = "InnerProduct";
-    fc.bottoms = {"pool"};
-    fc.tops = {"fc512"};
-    WeightsBlob weights;
-    weights.shape = {options.outputs, kChannels};
-    weights.data = options.weights.empty() ? DefaultWeights(options.outputs) : options.weights;
-    WeightsBlob bias;
-    bias.shape = {options.outputs};
-    bias.data = options.bias.empty() ? DefaultBias(options.outputs) : options.bias;
-    fc.blobs = {weights, bias};
-    return {fc};
 }
 
 void WriteNetworkFiles(const std::string& folder, const std::string& definition,
@@ -183,89 +97,62 @@ void WriteNetworkFiles(const std::string& folder, const std::string& definition,
 void WriteFixtureNetwork(const std::string& folder, const NetworkOptions& options) {
     using Files = NetworkOptions::Files;
     if (options.files == Files::None) return;
-    WriteNetworkFiles(folder, FixtureDefinition(options), FixtureWeights(options));
+    WeightsLayer fc{"fc512", "InnerProduct", {"pool"}, {"fc512"}, {WeightsBlob(), WeightsBlob()}};
+    fc.blobs[0].shape = {options.outputs, 3};
+    fc.blobs[1].shape = {options.outputs};
+    for (int k = 0; k < options.outputs; ++k) {
+        for (int c = 0; c < 3; ++c) fc.blobs[0].data.push_back(Weight(k, c));
+        fc.blobs[1].data.push_back(Bias(k));
+    }
+    WriteNetworkFiles(folder, FixtureDefinition(options), {fc});
     if (options.meanFile) {
-        const cv::Mat mean = FixtureMeanBlob(options);
-        WeightsBlob blob;
-        blob.shape = {1, kChannels, options.height, options.width};
-        blob.data.assign(mean.ptr<float>(), mean.ptr<float>() + mean.total());
-        WriteBytes(folder + kMeanFileName, SerializeBlob(blob));
+        const cv::Mat mean = GradientMean(kSize, kSize);
+        WeightsBlob blob{{1, 3, kSize, kSize}, std::vector<float>(mean.ptr<float>(), mean.ptr<float>() + mean.total())};
+        WriteBytes(folder + "mean.binaryproto", SerializeBlob(blob));
     }
-    switch (options.files) {
-        case Files::MissingDefinition: std::filesystem::remove(folder + kNetworkDefinitionName); break;
-        case Files::MissingWeights: std::filesystem::remove(folder + kNetworkWeightsName); break;
-        case Files::GarbledDefinition:
-            WriteBytes(folder + kNetworkDefinitionName, "name: \"broken\"\nlayer {\n  name: \"data\"\n  type: {{\n");
-            break;
-        case Files::GarbledWeights:
-            // A length-delimited field claiming far more bytes than follow.
-            WriteBytes(folder + kNetworkWeightsName, std::string("\x0a\xff\xff\xff\x0f", 5) + "garbage");
-            break;
-        default: break;
-    }
+    if (options.files == Files::MissingDefinition) std::filesystem::remove(folder + kNetworkDefinitionName);
+    if (options.files == Files::MissingWeights) std::filesystem::remove(folder + kNetworkWeightsName);
+    if (options.files == Files::GarbledDefinition)
+        WriteBytes(folder + kNetworkDefinitionName, "name: \"broken\"\nlayer {\n  name: \"data\"\n  type: {{\n");
+    if (options.files == Files::GarbledWeights)  // a length-delimited field claiming far more bytes than follow
+        WriteBytes(folder + kNetworkWeightsName, std::string("\x0a\xff\xff\xff\x0f", 5) + "garbage");
 }
 
-namespace {
-
-// Per-channel average of the values the network's first layer receives.
-std::vector<double> PooledInput(const NetworkOptions& options, const cv::Mat& bgr8) {
-    if (bgr8.type() != CV_8UC3) throw std::invalid_argument("ExpectedFeature needs an 8-bit, 3-channel image");
-    int top = 0;
-    int left = 0;
-    int rows = bgr8.rows;
-    int cols = bgr8.cols;
-    if (options.memoryData && options.cropSize > 0) {
-        top = (bgr8.rows - options.cropSize) / 2;
-        left = (bgr8.cols - options.cropSize) / 2;
-        rows = cols = options.cropSize;
-    }
-    const cv::Mat meanBlob = options.memoryData && options.meanFile ? FixtureMeanBlob(options) : cv::Mat();
-    std::vector<double> sums(kChannels, 0.0);
-    for (int y = top; y < top + rows; ++y) {
-        for (int x = left; x < left + cols; ++x) {
-            const cv::Vec3b pixel = bgr8.at<cv::Vec3b>(y, x);
-            for (int c = 0; c < kChannels; ++c) {
-                float value = static_cast<float>(pixel[c]);
-                if (options.memoryData) {
-                    float mean = 0.0f;
-                    if (!meanBlob.empty())
-                        mean = meanBlob.ptr<float>(c, y)[x];
-                    else if (options.meanValues.size() == 1)
-                        mean = options.meanValues[0];
-                    else if (options.meanValues.size() == kChannels)
-                        mean = options.meanValues[static_cast<size_t>(c)];
-                    value = (value - mean) * (options.writeScale ? options.scale : 1.0f);
-                }
-                sums[static_cast<size_t>(c)] += value;
+cv::Mat HandInputBlob(const cv::Mat& bgr8, const InputTransform& t) {
+    const int rows = t.cropSize > 0 ? t.cropSize : bgr8.rows, cols = t.cropSize > 0 ? t.cropSize : bgr8.cols;
+    const int top = (bgr8.rows - rows) / 2, left = (bgr8.cols - cols) / 2;
+    const int shape[4] = {1, 3, rows, cols};
+    cv::Mat blob(4, shape, CV_32F);
+    const std::vector<float>& means = t.meanValues;
+    for (int c = 0; c < 3; ++c)
+        for (int y = 0; y < rows; ++y)
+            for (int x = 0; x < cols; ++x) {
+                float mean = means.empty() ? 0.0f : means[means.size() == 1 ? 0 : static_cast<size_t>(c)];
+                if (!t.meanBlob.empty()) mean = t.meanBlob.ptr<float>(c, top + y)[left + x];
+                const float pixel = bgr8.at<cv::Vec3b>(top + y, left + x)[c];
+                blob.ptr<float>(0, c, y)[x] = (pixel - mean) * t.scale;
             }
-        }
-    }
-    for (double& sum : sums) sum /= static_cast<double>(rows) * cols;
-    return sums;
+    return blob;
 }
 
-std::vector<float> FullyConnected(const NetworkOptions& options, const std::vector<double>& input) {
-    const std::vector<float> weights = options.weights.empty() ? DefaultWeights(options.outputs) : options.weights;
-    const std::vector<float> bias = options.bias.empty() ? DefaultBias(options.outputs) : options.bias;
-    std::vector<float> feature(static_cast<size_t>(options.outputs));
-    for (size_t k = 0; k < feature.size(); ++k) {
-        double value = bias[k];
-        for (size_t c = 0; c < kChannels; ++c) value += static_cast<double>(weights[k * kChannels + c]) * input[c];
-        if (options.reluOnOutput) value = std::max(value, 0.0);
-        feature[k] = static_cast<float>(value);
+std::vector<float> ExpectedFeature(const NetworkOptions& o, const cv::Mat& bgr8) {
+    InputTransform transform;  // a plain input: the raw pixel values
+    if (o.memoryData)
+        transform = {3, kSize, kSize, o.cropSize, o.writeScale ? o.scale : 1.0f,
+                     o.meanFile ? std::vector<float>() : o.meanValues, o.meanFile ? GradientMean(kSize, kSize) : cv::Mat()};
+    cv::Mat pooled;
+    cv::reduce(HandInputBlob(bgr8, transform).reshape(1, 3), pooled, 1, cv::REDUCE_AVG, CV_64F);
+    std::vector<float> feature;
+    for (int k = 0; k < o.outputs; ++k) {
+        double value = Bias(k);
+        for (int c = 0; c < 3; ++c) value += static_cast<double>(Weight(k, c)) * pooled.at<double>(c);
+        feature.push_back(static_cast<float>(o.reluOnOutput ? std::max(value, 0.0) : value));
     }
     return feature;
 }
 
-}  // namespace
-
-std::vector<float> ExpectedFeature(const NetworkOptions& options, const cv::Mat& bgr8) {
-    return FullyConnected(options, PooledInput(options, bgr8));
-}
-
 std::vector<float> ExpectedFeatureForColour(const NetworkOptions& options, const cv::Vec3b& bgr) {
-    const cv::Mat image(options.height, options.width, CV_8UC3, cv::Scalar(bgr[0], bgr[1], bgr[2]));
-    return ExpectedFeature(options, image);
+    return ExpectedFeature(options, cv::Mat(kSize, kSize, CV_8UC3, cv::Scalar(bgr[0], bgr[1], bgr[2])));
 }
 
 ClusterCentre CentreFromFeature(const std::vector<float>& feature) {
@@ -274,13 +161,10 @@ ClusterCentre CentreFromFeature(const std::vector<float>& feature) {
     return centre;
 }
 
-// ---- Whole model directories -----------------------------------------------
-
 FixtureOptions RandomDatabase(int clusters, int styles, uint32_t seed) {
     std::mt19937 random(seed);
     std::uniform_real_distribution<float> unit(0.0f, 1.0f);
     FixtureOptions options;
-
     options.centres.resize(static_cast<size_t>(clusters));
     for (ClusterCentre& centre : options.centres)
         for (float& value : centre) value = unit(random) * 4.0f - 2.0f;
@@ -290,10 +174,8 @@ FixtureOptions RandomDatabase(int clusters, int styles, uint32_t seed) {
         style = ColourStats{};
         style.chromaMean[0] = unit(random) * 40.0f - 20.0f;
         style.chromaMean[1] = unit(random) * 40.0f - 20.0f;
-        const float offDiagonal = unit(random) * 2.0f - 1.0f;
         style.chromaSqrtCov[0] = 2.0f + unit(random) * 8.0f;
-        style.chromaSqrtCov[1] = offDiagonal;
-        style.chromaSqrtCov[2] = offDiagonal;
+        style.chromaSqrtCov[1] = style.chromaSqrtCov[2] = unit(random) * 2.0f - 1.0f;
         style.chromaSqrtCov[3] = 2.0f + unit(random) * 8.0f;
         for (float& sample : style.lightness) sample = unit(random);
         std::sort(std::begin(style.lightness), std::end(style.lightness));
@@ -321,42 +203,44 @@ void RemoveTree(const std::string& path) {
     std::filesystem::remove_all(path, ignored);
 }
 
-ModelFixture::ModelFixture(const FixtureOptions& options) : m_root(MakeTempFolder()), m_options(options) {
+ModelFixture::ModelFixture(const FixtureOptions& o) : m_root(MakeTempFolder()) {
     try {
-        const std::string dataFolder = m_root + (options.trailingSeparator ? "/model/" : "/m/");
-        m_modelDir = options.trailingSeparator ? dataFolder : m_root + "/m";
+        const std::string dataFolder = m_root + (o.trailingSeparator ? "/model/" : "/m/");
+        m_modelDir = o.trailingSeparator ? dataFolder : m_root + "/m";
         std::filesystem::create_directories(dataFolder);
+        const auto size = [](size_t n) { return static_cast<int32_t>(n); };
+        std::vector<float> centres, styles, scores, distances;
+        for (const ClusterCentre& centre : o.centres) centres.insert(centres.end(), centre.begin(), centre.end());
+        for (const ColourStats& style : o.styles) styles.insert(styles.end(), style.data(), style.data() + 38);
+        const size_t columns = o.scores.empty() ? o.styles.size() : o.scores[0].size();
+        for (size_t i = 0; i < o.scores.size() * columns; ++i)
+            scores.push_back(o.transposeScores ? o.scores[i % o.scores.size()][i / o.scores.size()]
+                                               : o.scores[i / columns][i % columns]);
+        for (size_t i = 0; i < o.distances.size(); ++i)
+            distances.insert(distances.end(), o.distances[i].begin() + static_cast<long>(i), o.distances[i].end());
 
-        if (options.writeClusters) WriteClusterFile(DataFile(kClusterFileName), options.centres, options.clusterCount);
-        if (options.writeStyles) WriteStyleFile(DataFile(kStyleFileName), options.styles, options.styleCount);
-        if (options.writeScores)
-            WriteScoresFile(DataFile(kScoresFileName), options.scores, options.scoreRows,
-                            options.scoreColumns.value_or(static_cast<int32_t>(
-                                options.scores.empty() ? options.styles.size() : options.scores[0].size())),
-                            options.transposeScores);
-        if (options.writeDistances)
-            WriteDistanceFile(DataFile(kDistanceFileName),
-                              options.distanceCount.value_or(static_cast<int32_t>(options.distances.size())),
-                              UpperTriangle(options.distances));
-        WriteFixtureNetwork(m_modelDir + kNetworkFolder, options.network);
+        const int32_t rows = o.scoreRows.value_or(size(o.scores.size()));
+        const int32_t cols = o.scoreColumns.value_or(size(columns));
+        if (o.writeClusters)
+            WriteDataFile(DataFile(kClusterFileName), {o.clusterCount.value_or(size(o.centres.size()))}, centres);
+        if (o.writeStyles)
+            WriteDataFile(DataFile(kStyleFileName), {o.styleCount.value_or(size(o.styles.size()))}, styles);
+        if (o.writeScores)
+            WriteDataFile(DataFile(kScoresFileName), o.transposeScores ? std::vector<int32_t>{cols, rows}
+                                                                       : std::vector<int32_t>{rows, cols}, scores);
+        if (o.writeDistances)
+            WriteDataFile(DataFile(kDistanceFileName), {o.distanceCount.value_or(size(o.distances.size()))},
+                          distances);
+        WriteFixtureNetwork(m_modelDir + kNetworkFolder, o.network);
     } catch (...) {
         RemoveTree(m_root);
         throw;
     }
 }
 
-ModelFixture::ModelFixture(ModelFixture&& other) noexcept
-    : m_root(std::move(other.m_root)), m_modelDir(std::move(other.m_modelDir)), m_options(std::move(other.m_options)) {
-    other.m_root.clear();
-}
-
-ModelFixture::~ModelFixture() {
-    if (!m_root.empty()) RemoveTree(m_root);
-}
+ModelFixture::~ModelFixture() { RemoveTree(m_root); }
 
 std::string ModelFixture::DataFile(const char* name) const { return DataFilePath(m_modelDir, name); }
-
-std::string ModelFixture::NetworkFile(const char* name) const { return m_modelDir + kNetworkFolder + name; }
 
 }  // namespace fixtures
 }  // namespace vora
