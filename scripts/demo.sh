@@ -24,7 +24,7 @@ step "Installing dependencies (only what is missing)"
 timed bash scripts/install-deps.sh
 
 step "Building"
-cmake -S . -B build -DCMAKE_BUILD_TYPE=Release -DVORA_BUILD_TESTS=OFF -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
+cmake -S . -B build -DCMAKE_BUILD_TYPE=Release >/dev/null
 timed cmake --build build -j"$(nproc)" --target vora_cli vora-qres-extract
 
 step "Fetching the sample photographs"

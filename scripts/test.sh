@@ -13,7 +13,7 @@ jobs="$(nproc)"
 bash scripts/install-deps.sh
 
 echo "== Release build and tests"
-cmake -S . -B build -DCMAKE_BUILD_TYPE=Release >/dev/null
+cmake -S . -B build -DCMAKE_BUILD_TYPE=Release -DVORA_BUILD_TESTS=ON -DVORA_BUILD_TOOLS=ON -DVORA_BUILD_BENCHMARKS=ON >/dev/null
 cmake --build build -j "$jobs"
 VORA_QRES_EXTRACT="$root/build/tools/vora-qres-extract" bash scripts/fetch-photos.sh
 ctest --test-dir build --output-on-failure -j "$jobs"
