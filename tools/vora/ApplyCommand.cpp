@@ -48,11 +48,7 @@ int Run(const std::vector<std::string>& args) {
 
     Photo photo = ReadPhoto(photoPath);
 
-    std::string modelDir = parsed.Value("--model").value_or("");
-    std::error_code ec;
-    if (modelDir.empty() && !document.model.empty() && std::filesystem::is_directory(document.model, ec))
-        modelDir = document.model;
-    modelDir = ChooseModelDir(modelDir);
+    const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
     const auto api = OpenModel(modelDir);
 
     // Face corrections sit at normalised positions: on a photo of other

@@ -57,11 +57,7 @@ int Run(const std::vector<std::string>& args) {
     CheckRenderable(transfer, where);
     transfer.faceCorrections.clear();
 
-    std::string modelDir = parsed.Value("--model").value_or("");
-    std::error_code ec;
-    if (modelDir.empty() && !document.model.empty() && std::filesystem::is_directory(document.model, ec))
-        modelDir = document.model;
-    modelDir = ChooseModelDir(modelDir);
+    const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
     const auto api = OpenModel(modelDir);
 
     // One pixel per lattice point: red along a row, then green, then blue,

@@ -20,6 +20,12 @@ std::string ChooseModelDir(const std::string& given) {
     return "./model";
 }
 
+std::string ChooseModelDirForRecord(const std::string& given, const std::string& recorded) {
+    std::error_code ec;
+    if (given.empty() && !recorded.empty() && std::filesystem::is_directory(recorded, ec)) return recorded;
+    return ChooseModelDir(given);
+}
+
 std::string WithTrailingSlash(const std::string& dir) {
     if (dir.empty()) return "./";
     return dir.back() == '/' ? dir : dir + "/";

@@ -17,6 +17,10 @@ namespace cli {
 // --model, else $VORA_MODEL, else ./model.
 std::string ChooseModelDir(const std::string& given);
 
+// For rendering a saved transfer: --model, else the model the transfers file
+// records (when that folder still exists), else as ChooseModelDir.
+std::string ChooseModelDirForRecord(const std::string& given, const std::string& recorded);
+
 // The library joins the network folder to the directory without a separator
 // (DIR + "net/"), so the tool always hands it a directory ending in '/'.
 std::string WithTrailingSlash(const std::string& dir);

@@ -29,6 +29,7 @@
 
 #include "model/StyleDatabase.h"
 #include "support/ModelFixtures.h"
+#include "support/TestImages.h"
 #include "vora/Cli.h"
 #include "vora/TransferJson.h"
 
@@ -129,19 +130,6 @@ bool SameBytes(const cv::Mat& a, const cv::Mat& b) {
     return a.size() == b.size() && a.type() == b.type() && cv::norm(a, b, cv::NORM_INF) == 0.0;
 }
 
-bool SameBits(const vora::TRANSFER& a, const vora::TRANSFER& b) {
-    auto same = [](const void* x, const void* y, size_t n) { return std::memcmp(x, y, n) == 0; };
-    return a.clusterIndex == b.clusterIndex && a.styleIndex == b.styleIndex &&
-           same(a.contentMean, b.contentMean, sizeof a.contentMean) &&
-           same(a.styleMean, b.styleMean, sizeof a.styleMean) &&
-           same(a.chromaMatrix, b.chromaMatrix, sizeof a.chromaMatrix) &&
-           same(a.toneCurve, b.toneCurve, sizeof a.toneCurve) &&
-           same(&a.lightnessLow, &b.lightnessLow, 4) && same(&a.lightnessHigh, &b.lightnessHigh, 4) &&
-           a.faceCorrections.size() == b.faceCorrections.size() &&
-           (a.faceCorrections.empty() ||
-            same(a.faceCorrections.data(), b.faceCorrections.data(),
-                 a.faceCorrections.size() * sizeof(vora::FaceCorrection)));
-}
 
 // A library image over the pixels of rgb.
 std::unique_ptr<vora::IImage, void (*)(vora::IImage*)> Wrap(cv::Mat& rgb) {
@@ -292,7 +280,7 @@ TEST_F(CliTest, SuggestAndApplyGiveTheLibrarysBytesAndRecords) {
     bool anyFaceLifted = false;
     for (size_t k = 0; k < 3; ++k) {
         SCOPED_TRACE(k);
-        EXPECT_TRUE(SameBits(saved.transfers[k], expected[k]));
+        EXPECT_TRUE(vora::testimages::SameRecord(saved.transfers[k], expected[k]));
         anyFaceLifted = anyFaceLifted || !expected[k].faceCorrections.empty();
         const cv::Mat want = ApplyDirect(api, m_photo, expected[k]);
         EXPECT_TRUE(SameBytes(ReadRgb(m_work + "/sugg/photo-" + std::to_string(k) + ".png"), want));
@@ -357,8 +345,8 @@ TEST_F(CliTest, MatchGivesTheLibrarysTransfer) {
     ASSERT_EQ(api.compute_transfer(Wrap(content).get(), Wrap(style).get(), byImage, params), vora::STATUS_OK);
     ASSERT_EQ(api.compute_transfer(Wrap(content).get(), 11, byIndex, vora::VoraParameters()), vora::STATUS_OK);
 
-    EXPECT_TRUE(SameBits(vora::cli::ReadTransfersFile(m_work + "/m.json").transfers[0], byImage));
-    EXPECT_TRUE(SameBits(vora::cli::ReadTransfersFile(m_work + "/i.json").transfers[0], byIndex));
+    EXPECT_TRUE(vora::testimages::SameRecord(vora::cli::ReadTransfersFile(m_work + "/m.json").transfers[0], byImage));
+    EXPECT_TRUE(vora::testimages::SameRecord(vora::cli::ReadTransfersFile(m_work + "/i.json").transfers[0], byIndex));
     EXPECT_TRUE(SameBytes(ReadRgb(m_work + "/m.png"), ApplyDirect(api, m_photo, byImage)));
     EXPECT_TRUE(SameBytes(ReadRgb(m_work + "/i.png"), ApplyDirect(api, m_photo, byIndex)));
 }
@@ -402,7 +390,7 @@ TEST(TransferJson, RoundTripIsBitExactForEveryKindOfFloat) {
     const std::string text = vora::cli::SerializeTransfers(document);
     const vora::cli::TransferDocument back = vora::cli::ParseTransfers(text, "mem.json");
     ASSERT_EQ(back.transfers.size(), document.transfers.size());
-    for (size_t r = 0; r < back.transfers.size(); ++r) EXPECT_TRUE(SameBits(back.transfers[r], document.transfers[r]));
+    for (size_t r = 0; r < back.transfers.size(); ++r) EXPECT_TRUE(vora::testimages::SameRecord(back.transfers[r], document.transfers[r]));
     EXPECT_EQ(back.faces[0].right, 0.30000000000000004);
     EXPECT_EQ(back.faces[0].top, 1.0 / 3.0);
     EXPECT_EQ(back.rankingFactor, 0.7f);
