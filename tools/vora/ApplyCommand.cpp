@@ -1,7 +1,6 @@
 // vora apply: one saved transfer rendered onto a photo at full resolution.
 
 #include <cmath>
-#include <filesystem>
 #include <iostream>
 
 #include "vora/Cli.h"
