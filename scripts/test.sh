@@ -26,7 +26,9 @@ cmake --build build/host -j "$jobs" >/dev/null
 # A real run: the installed tool builds a small model from eight sample
 # photos, and the host restyles a portrait with it.
 mkdir -p build/host/styles
-ls .cache/photos/styles | sort | head -n 8 | while read -r f; do cp ".cache/photos/styles/$f" build/host/styles/; done
+# No "| head" here: under pipefail the writer it cuts off fails with SIGPIPE.
+mapfile -t photos < <(find .cache/photos/styles -maxdepth 1 -type f | LC_ALL=C sort)
+cp "${photos[@]:0:8}" build/host/styles/
 build/install/bin/vora build-model --styles build/host/styles --out build/host/model --force >/dev/null
 LD_LIBRARY_PATH="$root/build/install/lib" build/host/vora_host build/host/model/ \
     .cache/photos/content/grace_hopper.jpg build/host/restyled.png 256
