@@ -4,7 +4,6 @@
 
 #include <stdlib.h>
 
-#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -36,13 +35,6 @@ inline std::string ReadBytes(const fs::path& path) {
     std::ostringstream out;
     out << file.rdbuf();
     return out.str();
-}
-
-template <class T>
-T At(const std::string& bytes, size_t offset) {
-    T value;
-    std::memcpy(&value, bytes.data() + offset, sizeof value);
-    return value;
 }
 
 // A smooth random colour field, different for each seed.

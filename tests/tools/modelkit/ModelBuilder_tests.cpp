@@ -5,9 +5,11 @@
 #include <map>
 #include <tuple>
 
+#include <gmock/gmock.h>
 #include <opencv2/imgcodecs.hpp>
 
 #include "KitTesting.h"
+#include "model/Engine.h"
 #include "model/FeatureNetwork.h"
 #include "model/StyleDatabase.h"
 #include "modelkit/Photos.h"
@@ -30,12 +32,11 @@ std::vector<cv::Mat> WriteStyles(const fs::path& dir) {
     Scene(3).convertTo(deep, CV_16U, 257.0, 100.0);  // reduces to the nearest 8-bit value
     cv::randu(alpha, 0, 256);
     cv::merge(std::vector<cv::Mat>{Scene(4), alpha}, withAlpha);
-    const std::vector<std::tuple<std::string, cv::Mat, cv::Mat>> files = {
-        {"a_plain.png", Scene(1), Scene(1)},         {"b_grey.png", grey, greyBgr},
-        {"c_deep.png", deep, Scene(3)},              {"d_alpha.png", withAlpha, Scene(4)},
-        {"e_tiff.TIF", Scene(5), Scene(5)},          {"f_lossless.webp", Scene(6, 130, 90), Scene(6, 130, 90)}};
     std::vector<cv::Mat> asRead;
-    for (const auto& [name, written, expected] : files) {
+    for (const auto& [name, written, expected] : std::vector<std::tuple<std::string, cv::Mat, cv::Mat>>{
+             {"a_plain.png", Scene(1), Scene(1)},         {"b_grey.png", grey, greyBgr},
+             {"c_deep.png", deep, Scene(3)},              {"d_alpha.png", withAlpha, Scene(4)},
+             {"e_tiff.TIF", Scene(5), Scene(5)},          {"f_lossless.webp", Scene(6, 130, 90), Scene(6, 130, 90)}}) {
         EXPECT_TRUE(cv::imwrite((dir / name).string(), written, {cv::IMWRITE_WEBP_QUALITY, 101})) << name;
         asRead.push_back(expected);
     }
@@ -43,14 +44,17 @@ std::vector<cv::Mat> WriteStyles(const fs::path& dir) {
     return asRead;
 }
 
-// The style set and its default model, built once for the tests that only read them.
+// The style set and its default model, built once for the tests that only
+// read them, and that model as the library loads it.
 struct Built {
     TempDir styles, model;
     std::vector<cv::Mat> asRead = WriteStyles(styles.path);
     std::vector<double> progress;
+    Engine engine;
     Built() {
         BuildModel({styles.path.string(), "", model.path.string(), 0,
                     [this](double fraction, const std::string&) { progress.push_back(fraction); }});
+        engine.LoadModel(model.path.string() + "/");
     }
 };
 
@@ -86,39 +90,34 @@ TEST(ModelBuilder, SameInputsGiveSameBytesInTheDocumentedLayouts) {
     EXPECT_EQ(files.size(), 6u);  // no staging leftovers
     EXPECT_TRUE(files == Files(again.path));
 
-    // Six photos, six content samples each; one cluster per ten samples.
-    using Layout = std::tuple<const char*, std::vector<int32_t>, size_t>;  // file, header, size
-    for (const auto& [file, header, size] : std::vector<Layout>{{kClusterFileName, {4}, 4 + 2048 * 4},
-                                                                 {kStyleFileName, {6}, 4 + 152 * 6},
-                                                                 {kScoresFileName, {4, 6}, 8 + 4 * 4 * 6},
-                                                                 {kDistanceFileName, {6}, 4 + 4 * 21}}) {
-        const std::string bytes = ReadBytes(built.model.path / file);
-        EXPECT_EQ(bytes.size(), size) << file;
-        for (size_t i = 0; i < header.size(); ++i) EXPECT_EQ(At<int32_t>(bytes, 4 * i), header[i]) << file;
-    }
-    ASSERT_FALSE(built.progress.empty());
-    EXPECT_EQ(built.progress.back(), 1.0);
-    EXPECT_TRUE(std::is_sorted(built.progress.begin(), built.progress.end()));
+    // The library loads the model, and no file holds more than its header
+    // promises. Six photos, six content samples each; one cluster per ten samples.
+    EXPECT_TRUE(built.engine.CanRankStyles());
+    EXPECT_EQ(built.engine.clusterCount, 4);
+    for (const auto& [file, size] : std::map<std::string, size_t>{{kClusterFileName, 4 + 2048 * 4},
+                                                                  {kStyleFileName, 4 + 152 * 6},
+                                                                  {kScoresFileName, 8 + 4 * 4 * 6},
+                                                                  {kDistanceFileName, 4 + 4 * 21}})
+        EXPECT_EQ(files.at(file).size(), size) << file;
+    const std::vector<double>& progress = built.progress;
+    EXPECT_TRUE(!progress.empty() && progress.back() == 1.0 && std::is_sorted(progress.begin(), progress.end()));
 }
 
 TEST(ModelBuilder, RecordsAndDistancesComeFromEachPhotosColours) {
     const Built& built = Shared();
-    // Records in file-name order, 38 words each: the library's statistics of
-    // the photo as read (grey expanded, 16-bit reduced, alpha dropped).
-    const std::string records = ReadBytes(built.model.path / kStyleFileName);
+    // Records in file-name order, the 38 stored words of each: the library's
+    // statistics of the photo as read (grey expanded, 16-bit reduced, alpha dropped).
+    const std::vector<ColourStats>& stored = built.engine.styleRecords;
     const size_t n = built.asRead.size();
-    std::vector<ColourStats> stored(n);
+    ASSERT_EQ(stored.size(), n);
     for (size_t s = 0; s < n; ++s) {
         const ColourStats expected = LibraryStats(built.asRead[s]);
-        std::memcpy(stored[s].data(), records.data() + 4 + 152 * s, 152);
         for (int w = 0; w < 38; ++w) EXPECT_EQ(stored[s].data()[w], expected.data()[w]) << "style " << s << " word " << w;
     }
-    // Upper triangle with diagonal, row by row.
-    const std::string distances = ReadBytes(built.model.path / kDistanceFileName);
-    size_t offset = 4;
+    // The upper triangle, as the library reads it back into a full matrix.
     for (size_t i = 0; i < n; ++i)
-        for (size_t j = i; j < n; ++j, offset += 4)
-            EXPECT_EQ(At<float>(distances, offset), i == j ? 0.0f : float(StyleDistance(stored[i], stored[j])))
+        for (size_t j = 0; j < n; ++j)
+            EXPECT_EQ(built.engine.styleDistances[i][j], i == j ? 0.0f : float(StyleDistance(stored[i], stored[j])))
                 << i << "," << j;
 }
 
@@ -138,25 +137,22 @@ TEST(StyleDistance, ReadsInLabUnits) {
 
 TEST(ModelBuilder, NetworkLoadsAndEachStyleScoresBestInItsNearestCluster) {
     const Built& built = Shared();
-    const fs::path net = built.model.path / kNetworkFolder;
-    auto network = FeatureNetwork::Load((net / kNetworkDefinitionName).string(), (net / kNetworkWeightsName).string());
-    ASSERT_TRUE(network->hasMemoryDataInput());
-    std::string centres = ReadBytes(built.model.path / kClusterFileName);
-    std::string scores = ReadBytes(built.model.path / kScoresFileName);
-    const int clusters = At<int32_t>(centres, 0), styles = At<int32_t>(scores, 4);
-    const cv::Mat centreRows(clusters, 512, CV_32F, &centres[4]), scoreRows(clusters, styles, CV_32F, &scores[8]);
+    const Engine& engine = built.engine;
+    ASSERT_TRUE(engine.network && engine.network->hasMemoryDataInput());
+    std::string scores = ReadBytes(built.model.path / kScoresFileName);  // the library keeps only rankings
+    const cv::Mat scoreRows(engine.clusterCount, engine.styleCount, CV_32F, &scores[8]);
     const std::vector<std::string> photos = ListPhotos(built.styles.path.string());
-    ASSERT_EQ(int(photos.size()), styles);
-    for (int s = 0; s < styles; ++s) {
-        cv::Mat canvas, distances;
+    for (int s = 0; s < engine.styleCount; ++s) {
+        cv::Mat canvas;
         ASSERT_TRUE(PrepareNetworkImage(ReadPhoto(photos[s]), canvas, kNetworkImageSize, kNetworkInputSize));
-        const std::vector<float> feature = network->Forward(canvas);
+        const std::vector<float> feature = engine.network->Forward(canvas);
         ASSERT_EQ(feature.size(), 512u);
-        for (int k = 0; k < clusters; ++k) distances.push_back(cv::norm(centreRows.row(k), cv::Mat(feature).t()));
-        cv::Point nearest, best;
-        cv::minMaxLoc(distances, nullptr, nullptr, &nearest);
+        std::vector<double> distances;
+        for (const ClusterCentre& centre : engine.clusterCentres)
+            distances.push_back(cv::norm(cv::Mat(std::vector<float>(centre.begin(), centre.end())), cv::Mat(feature)));
+        cv::Point best;
         cv::minMaxLoc(scoreRows.col(s), nullptr, nullptr, nullptr, &best);
-        EXPECT_EQ(best.y, nearest.y) << photos[s];
+        EXPECT_EQ(best.y, std::min_element(distances.begin(), distances.end()) - distances.begin()) << photos[s];
     }
 }
 
@@ -166,7 +162,7 @@ TEST(ModelBuilder, ContentFolderGivesTheClusterSamples) {
     // Five content photos, taken as they are: one cluster by default, five at most.
     for (int clusters : {0, 5}) {
         Build(Shared().styles.path, out.path, clusters, content.path);
-        EXPECT_EQ(At<int32_t>(ReadBytes(out.path / kClusterFileName), 0), std::max(clusters, 1));
+        EXPECT_EQ(ReadBytes(out.path / kClusterFileName).size(), 4 + 2048 * size_t(std::max(clusters, 1)));
     }
 }
 
@@ -184,14 +180,9 @@ TEST(ModelBuilder, FailuresSayWhatIsWrongAndLeaveTheModelAlone) {
              {(empty.path / "missing").string(), model, 0, "is not a readable folder"},
              {good, model, 1000, "cannot make 1000 clusters from 36 content samples"},
              {broken.path.string(), model, 0, "cannot read the photo " + (broken.path / "zz_broken.jpg").string()},
-             {good, underFile, 0, "cannot create the model folder " + underFile}}) {
-        try {
-            Build(styles, out, clusters);
-            ADD_FAILURE() << "built despite: " << message;
-        } catch (const std::runtime_error& e) {
-            EXPECT_NE(std::string(e.what()).find(message), std::string::npos) << e.what();
-        }
-    }
+             {good, underFile, 0, "cannot create the model folder " + underFile}})
+        EXPECT_THAT(([s = styles, o = out, k = clusters] { Build(s, o, k); }),  // bindings cannot be captured
+                    testing::ThrowsMessage<std::runtime_error>(testing::HasSubstr(message)));
     // The failed builds left the earlier model as it was, and nothing else.
     EXPECT_TRUE(Files(built.model.path) == before);
 }
