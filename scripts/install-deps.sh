@@ -7,7 +7,7 @@ packages=(
     g++ cmake make pkgconf
     libopencv-core-dev libopencv-imgproc-dev libopencv-dnn-dev libopencv-imgcodecs-dev
     libopencv-objdetect-dev opencv-data
-    libtbb-dev libgtest-dev libbenchmark-dev zlib1g-dev
+    libtbb-dev libgtest-dev libgmock-dev libbenchmark-dev zlib1g-dev
     nlohmann-json3-dev libdlib-dev
 )
 
