@@ -18,8 +18,6 @@ static_assert(!std::is_destructible_v<IImage>, "an image is not deleted through 
 static_assert(!std::is_copy_constructible_v<CRGB8Image> && !std::is_copy_constructible_v<CTileImage>,
               "image objects are not copied");
 
-const size_t kLayout[4] = {11, 22, 33, 44};
-
 std::string Geometry(const IImage& image) {
     std::ostringstream text;
     text << image.GetWidth() << "x" << image.GetHeight() << " of " << image.GetFullResSize().width << "x"
@@ -29,50 +27,38 @@ std::string Geometry(const IImage& image) {
     return text.str();
 }
 
-// A whole image packs its rows; a tile's rows are a full image width apart,
-// with or without pixels. Both keep the caller's pointer and layout values, and
-// count references from one.
-TEST(ImageObjects, GeometryStridesAndReferenceCounts) {
+// A whole image packs its rows (a pixel-less one is geometry only); a tile's
+// rows are a full image width apart, with or without pixels. All keep the
+// caller's pointer and layout values and count references from one; every way
+// of ending one, the two plain functions crossed, leaves the pixels alone.
+TEST(ImageObjects, GeometryStridesReferenceCountsAndReleasing) {
+    const size_t layout[4] = {11, 22, 33, 44};
     std::vector<uint8_t> packed(36), full(400 * 10 * 3);
+    std::iota(packed.begin(), packed.end(), static_cast<uint8_t>(1));
+    std::iota(full.begin(), full.end(), static_cast<uint8_t>(7));
+    const std::vector<uint8_t> packedBefore = packed, fullBefore = full;
     uint8_t* first = full.data() + (2 * 400 + 50) * 3;
-    const std::tuple<IImage*, const char*, uint8_t*> cases[] = {
-        {CreateImageObj(3, 4, 3, kLayout, packed.data(), {4, 3}, {}), "4x3 of 4x3 at 0,0, strides 12/3, 3 channels",
-         packed.data()},
-        {GetTileImageObj(5, 100, 3, kLayout, first, {400, 10}, {50, 2}),
-         "100x5 of 400x10 at 50,2, strides 1200/3, 3 channels", first},
-        {GetTileImageObj(5, 100, 4, kLayout, nullptr, {400, 10}, {}),
-         "100x5 of 400x10 at 0,0, strides 1600/4, 4 channels", nullptr}};
-    for (const auto& [image, geometry, data] : cases) {
+    const std::tuple<IImage*, const char*, uint8_t*, void (*)(IImage*)> cases[] = {
+        {CreateImageObj(3, 4, 3, layout, packed.data(), {4, 3}, {}), "4x3 of 4x3 at 0,0, strides 12/3, 3 channels",
+         packed.data(), ReturnTileImageObj},
+        {CreateImageObj(480, 640, 3, layout, nullptr, {640, 480}, {}),
+         "640x480 of 640x480 at 0,0, strides 0/0, 3 channels", nullptr, [](IImage* image) { image->Release(); }},
+        {GetTileImageObj(5, 100, 3, layout, first, {400, 10}, {50, 2}),
+         "100x5 of 400x10 at 50,2, strides 1200/3, 3 channels", first, DestroyImageObj},
+        {GetTileImageObj(5, 100, 4, layout, nullptr, {400, 10}, {}),
+         "100x5 of 400x10 at 0,0, strides 1600/4, 4 channels", nullptr, [](IImage* image) { image->Destroy(); }}};
+    for (const auto& [image, geometry, data, end] : cases) {
         ASSERT_NE(image, nullptr);
         EXPECT_EQ(Geometry(*image), geometry);
-        EXPECT_EQ(image->GetData(), data);
-        EXPECT_EQ(image->GetConstData(), data);
-        for (int i = 0; i < 4; ++i) EXPECT_EQ(image->GetLayoutValue(i), kLayout[i]);
-        EXPECT_EQ(image->AddRef(), 1u);   // the count before the increment
-        EXPECT_EQ(image->AddRef(), 2u);
-        EXPECT_EQ(image->Release(), 2u);  // two owners remain
-        EXPECT_EQ(image->Release(), 1u);  // one owner remains; the object is alive
+        EXPECT_TRUE(image->GetData() == data && image->GetConstData() == data) << geometry;
+        for (int i = 0; i < 4; ++i) EXPECT_EQ(image->GetLayoutValue(i), layout[i]);
+        // AddRef gives the count before, Release the count after; one owner keeps the object alive.
+        const uint32_t counts[] = {image->AddRef(), image->AddRef(), image->Release(), image->Release()};
+        EXPECT_EQ(std::vector<uint32_t>(counts, counts + 4), (std::vector<uint32_t>{1, 2, 2, 1}));
         EXPECT_GT(image->GetWidth(), 0u);
-        image->Release();  // the last owner deletes
+        end(image);
     }
-    IImage* bare = CreateImageObj(480, 640, 3, kLayout, nullptr, {640, 480}, {});  // geometry only
-    EXPECT_TRUE(bare->GetData() == nullptr && bare->GetWidth() == 640 && bare->GetHeight() == 480);
-    DestroyImageObj(bare);
-}
-
-// Every way of ending an object, on both classes, the two plain functions crossed.
-TEST(ImageObjects, ReleasingNeverTouchesPixels) {
-    std::vector<uint8_t> expected(400 * 4 * 3), pixels;
-    std::iota(expected.begin(), expected.end(), static_cast<uint8_t>(7));
-    pixels = expected;
-    const CFullResImageSize full(400, 4);
-    DestroyImageObj(CreateImageObj(4, 400, 3, kLayout, pixels.data(), full, {}));
-    ReturnTileImageObj(CreateImageObj(4, 400, 3, kLayout, pixels.data(), full, {}));
-    DestroyImageObj(GetTileImageObj(2, 100, 3, kLayout, pixels.data() + 150, full, {50, 0}));
-    ReturnTileImageObj(GetTileImageObj(2, 100, 3, kLayout, pixels.data() + 150, full, {50, 0}));
-    CreateImageObj(4, 400, 3, kLayout, pixels.data(), full, {})->Destroy();
-    GetTileImageObj(2, 100, 3, kLayout, pixels.data(), full, {})->Release();
-    EXPECT_EQ(pixels, expected);
+    EXPECT_TRUE(packed == packedBefore && full == fullBefore);
 }
 
 }  // namespace

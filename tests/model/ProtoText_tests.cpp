@@ -9,6 +9,15 @@ namespace {
 
 namespace pt = prototext;
 
+// The whole tree on one line: name:value (quoted values in quotes), blocks in braces.
+std::string Flat(const pt::Message& message) {
+    std::string text;
+    for (const pt::Field& f : message.fields)
+        text += " " + f.name +
+                (f.isMessage ? " {" + Flat(f.message) + " }" : f.quoted ? ":\"" + f.value + "\"" : ":" + f.value);
+    return text;
+}
+
 TEST(ProtoText, ReadsCommentsNestedBlocksAndListShorthand) {
     const pt::Message net = pt::Parse(R"(# leading comment
 name: "net"  # trailing comment
@@ -21,38 +30,19 @@ layer <
   pooling_param { pool: AVE kernel_size: -1.5e-3 mean_value: [104, 117.5] shape: [{dim: 1}, {dim: 2}] empty: [] }
 >
 )");
-    ASSERT_EQ(net.fields.size(), 3u);
-    const std::vector<const pt::Field*> layers = net.All("layer");
-    ASSERT_EQ(layers.size(), 2u);
-    const pt::Field* shape = layers[0]->message.First("input_param")->message.First("shape");
-    ASSERT_NE(shape, nullptr);
-    EXPECT_EQ(shape->message.Scalars("dim"), (std::vector<std::string>{"1", "3"}));
-    EXPECT_EQ(layers[1]->message.Scalar("name"), "pool");
-
-    const pt::Message& params = layers[1]->message.First("pooling_param")->message;
-    EXPECT_EQ(params.Scalar("pool"), "AVE");
-    EXPECT_FALSE(params.First("pool")->quoted);
-    EXPECT_EQ(params.Scalar("kernel_size"), "-1.5e-3");
-    EXPECT_EQ(params.Scalar("missing", "fallback"), "fallback");
-    EXPECT_EQ(params.Scalars("mean_value"), (std::vector<std::string>{"104", "117.5"}));
-    EXPECT_EQ(params.All("shape").at(1)->message.Scalar("dim"), "2");
-    EXPECT_EQ(params.First("empty"), nullptr);
-
-    const std::string written = pt::Write(net);  // and back: the same tree, the same text
-    const pt::Message again = pt::Parse(written);
-    EXPECT_EQ(pt::Write(again), written);
-    EXPECT_EQ(again.All("layer")[1]->message.First("pooling_param")->message.Scalars("mean_value"),
-              params.Scalars("mean_value"));
+    const std::string flat = R"( name:"net" layer { name:"data" input_param { shape { dim:1 dim:3 } } } layer {)"
+                             R"( name:"pool" bottom:"data" pooling_param { pool:AVE kernel_size:-1.5e-3)"
+                             R"( mean_value:104 mean_value:117.5 shape { dim:1 } shape { dim:2 } } })";
+    EXPECT_EQ(Flat(net), flat);
+    EXPECT_EQ(Flat(pt::Parse(pt::Write(net))), flat);  // and back
 }
 
 TEST(ProtoText, DecodesStringEscapesJoinsLiteralsAndWritesThemBack) {
     const pt::Message message = pt::Parse(
         R"(a: "quote \" hash # brace { tab\t nl\n oct\101 hex\x42\x01 uni\u00e9 back\\" b: 'it''s' "!")");
-    const std::string decoded = "quote \" hash # brace { tab\t nl\n octA hexB\x01 uni\xc3\xa9 back\\";
-    EXPECT_EQ(message.Scalar("a"), decoded);
-    EXPECT_TRUE(message.First("a")->quoted);
-    EXPECT_EQ(message.Scalar("b"), "its!");
-    EXPECT_EQ(pt::Parse(pt::Write(message)).Scalar("a"), decoded);
+    const std::string flat = " a:\"quote \" hash # brace { tab\t nl\n octA hexB\x01 uni\xc3\xa9 back\\\" b:\"its!\"";
+    EXPECT_EQ(Flat(message), flat);
+    EXPECT_EQ(Flat(pt::Parse(pt::Write(message))), flat);
 }
 
 TEST(ProtoText, ReportsWhereTheTextIsMalformed) {

@@ -6,14 +6,9 @@
 //
 // The fixture network is
 //   MemoryData (1 x 3 x 256 x 256; crop, mean, scale)
-//   -> global average Pooling -> InnerProduct to `outputs` [-> in-place ReLU]
-// so its feature is W * avg(input blob) + b, easy to compute by hand. Typical use:
-//
-//   fixtures::FixtureOptions options = fixtures::RandomDatabase(4, 10);
-//   options.centres[2] = fixtures::CentreFromFeature(
-//       fixtures::ExpectedFeatureForColour(options.network, cv::Vec3b(40, 90, 200)));
-//   fixtures::ModelFixture model(options);  // a uniform content image of that
-//                                           // colour now lands in cluster 2
+//   -> global average Pooling -> InnerProduct to `outputs`
+// so its feature is W * avg(input blob) + b, easy to compute by hand
+// (ExpectedFeature), e.g. to place a cluster centre on a chosen colour.
 
 #include <cstdint>
 #include <optional>
@@ -35,14 +30,8 @@ void TruncateFile(const std::string& path, size_t size);
 void WriteDataFile(const std::string& path, const std::vector<int32_t>& header, const std::vector<float>& values);
 
 struct NetworkOptions {
-    enum class Files {
-        Valid,
-        None,               // no network folder at all
-        MissingDefinition,  // only the weights
-        MissingWeights,     // only the definition
-        GarbledDefinition,  // a definition that does not parse
-        GarbledWeights,     // weights that do not parse
-    };
+    // None: no network folder; MissingWeights: only the definition; Garbled*: a file that does not parse.
+    enum class Files { Valid, None, MissingWeights, GarbledDefinition, GarbledWeights };
     Files files = Files::Valid;
 
     // false: a plain input "data" of 1 x 3 x 256 x 256, fed raw pixel values.
@@ -51,13 +40,12 @@ struct NetworkOptions {
     std::vector<float> meanValues = {104.0f, 117.0f, 123.0f};  // written as given: none, one, or per channel
     float scale = 0.015625f;
     bool writeScale = true;  // false: no scale field
-    bool meanFile = false;   // GradientMean(256, 256) in "mean.binaryproto" instead of mean_value
-    bool reluOnOutput = false;
+    bool meanFile = false;   // RandomMean(256, 256) in "mean.binaryproto" instead of mean_value
     int outputs = 512;
 };
 
-// A 3 x height x width CV_32F mean blob with distinct values.
-cv::Mat GradientMean(int height, int width);
+// A 3 x height x width CV_32F mean blob of distinct values, the same for the same size.
+cv::Mat RandomMean(int height, int width);
 
 // Writes folder + the definition and weights file names (folder ends in "/").
 void WriteFixtureNetwork(const std::string& folder, const NetworkOptions& options);
@@ -70,8 +58,6 @@ cv::Mat HandInputBlob(const cv::Mat& bgr8, const InputTransform& transform);
 // The fixture network's feature for a 256 x 256 B, G, R image, computed by hand
 // in double from HandInputBlob: expect agreement to about 1e-4, not bit equality.
 std::vector<float> ExpectedFeature(const NetworkOptions& options, const cv::Mat& bgr8);
-std::vector<float> ExpectedFeatureForColour(const NetworkOptions& options, const cv::Vec3b& bgr);
-ClusterCentre CentreFromFeature(const std::vector<float>& feature);  // first 512 values, zero-padded
 
 struct FixtureOptions {
     std::vector<ClusterCentre> centres;
@@ -80,20 +66,10 @@ struct FixtureOptions {
     std::vector<std::vector<float>> distances;  // styles x styles; its upper triangle is written
 
     // Header counts that disagree with the contents.
-    std::optional<int32_t> clusterCount;
-    std::optional<int32_t> styleCount;
-    std::optional<int32_t> scoreRows;
-    std::optional<int32_t> scoreColumns;
-    std::optional<int32_t> distanceCount;
+    std::optional<int32_t> clusterCount, styleCount, scoreRows, scoreColumns, distanceCount;
     bool transposeScores = false;  // header C, R and the matrix column by column
 
-    bool writeClusters = true;
-    bool writeStyles = true;
-    bool writeScores = true;
-    bool writeDistances = true;
-
-    // false: modelDir() is ".../m" and the network goes to ".../mnet/".
-    bool trailingSeparator = true;
+    bool writeClusters = true, writeStyles = true, writeScores = true, writeDistances = true;
 
     NetworkOptions network;
 };
@@ -110,14 +86,13 @@ public:
     ModelFixture(const ModelFixture&) = delete;
     ModelFixture& operator=(const ModelFixture&) = delete;
 
-    // "<root>/model/", or "<root>/m" without trailingSeparator.
+    // "<root>/model/"
     const std::string& modelDir() const { return m_modelDir; }
     const std::string& root() const { return m_root; }
     std::string DataFile(const char* name) const;  // where the loader reads it
 
 private:
-    std::string m_root;
-    std::string m_modelDir;
+    std::string m_root, m_modelDir;
 };
 
 // A fresh empty temporary folder (no trailing separator); the caller removes it.

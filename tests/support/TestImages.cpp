@@ -1,7 +1,7 @@
 #include "support/TestImages.h"
 
 #include <cmath>
-#include <cstring>
+#include <string>
 
 #include <opencv2/imgproc.hpp>
 
@@ -47,17 +47,14 @@ ImageHandle::ImageHandle(cv::Mat& rgb) {
 ImageHandle::~ImageHandle() { DestroyImageObj(image); }
 
 bool SameRecord(const TRANSFER& a, const TRANSFER& b) {
-    auto same = [](const void* x, const void* y, size_t n) { return std::memcmp(x, y, n) == 0; };
-    return a.clusterIndex == b.clusterIndex && a.styleIndex == b.styleIndex &&
-           same(a.contentMean, b.contentMean, sizeof a.contentMean) &&
-           same(a.styleMean, b.styleMean, sizeof a.styleMean) &&
-           same(a.chromaMatrix, b.chromaMatrix, sizeof a.chromaMatrix) &&
-           same(a.toneCurve, b.toneCurve, sizeof a.toneCurve) &&
-           same(&a.lightnessLow, &b.lightnessLow, sizeof a.lightnessLow) &&
-           same(&a.lightnessHigh, &b.lightnessHigh, sizeof a.lightnessHigh) &&
-           a.faceCorrections.size() == b.faceCorrections.size() &&
-           (a.faceCorrections.empty() ||
-            same(a.faceCorrections.data(), b.faceCorrections.data(), a.faceCorrections.size() * sizeof(FaceCorrection)));
+    // The fixed fields are 4-byte values in a row from clusterIndex to lightnessHigh, then the faces.
+    const auto bytes = [](const TRANSFER& t) {
+        const char* first = reinterpret_cast<const char*>(&t.clusterIndex);
+        return std::string(first, reinterpret_cast<const char*>(&t.lightnessHigh + 1)) +
+               std::string(reinterpret_cast<const char*>(t.faceCorrections.data()),
+                           t.faceCorrections.size() * sizeof(FaceCorrection));
+    };
+    return bytes(a) == bytes(b);
 }
 
 }  // namespace testimages
