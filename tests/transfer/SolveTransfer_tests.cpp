@@ -20,27 +20,26 @@ ColourStats MakeStats(std::array<float, 4> sqrtCov) {
 
 const ColourStats kGrey = MakeStats({0, 0, 0, 0});
 
-// How far the solved chroma map lies from `expected`.
-double MapError(const ColourStats& content, const ColourStats& style, const cv::Matx22f& expected,
-                float solveFactor = 1.0f) {
+TRANSFER Solve(const ColourStats& content, const ColourStats& style, float solveFactor = 1.0f) {
     VoraParameters params;
     params.solveFactor = solveFactor;
     TRANSFER t;
     SolveTransfer(content, style, t, params);
+    return t;
+}
+double MapError(const TRANSFER& t, const cv::Matx22f& expected) {
     return cv::norm(cv::Matx22f(t.chromaMatrix) - expected, cv::NORM_INF);
 }
 
 TEST(SolveTransfer, EqualStatisticsGiveTheIdentityMap) {
     // Diagonal above the floor of 15, positive off-diagonal: the floor changes nothing.
-    ColourStats content = MakeStats({30, 4, 4, 20});
+    ColourStats content = MakeStats({30, 4, 4, 20}), style = content;
     content.chromaMean[0] = 3.5f;
     content.lightnessLow = 0.12f;
     content.lightnessHigh = 0.87f;
-    ColourStats style = MakeStats({30, 4, 4, 20});
     style.chromaMean[1] = 2.0f;  // the means do not enter the map; the style's percentile points are 0
-    TRANSFER t;
-    SolveTransfer(content, style, t, VoraParameters());
-    EXPECT_LE(cv::norm(cv::Matx22f(t.chromaMatrix) - cv::Matx22f::eye(), cv::NORM_INF), 1e-5);
+    const TRANSFER t = Solve(content, style);
+    EXPECT_LE(MapError(t, cv::Matx22f::eye()), 1e-5);
     EXPECT_EQ(cv::Vec4f(t.contentMean[0], t.contentMean[1], t.styleMean[0], t.styleMean[1]),
               cv::Vec4f(3.5f, 0, 0, 2.0f));
     EXPECT_EQ(cv::Vec2f(t.lightnessLow, t.lightnessHigh), cv::Vec2f(0.12f, 0.87f));
@@ -49,14 +48,14 @@ TEST(SolveTransfer, EqualStatisticsGiveTheIdentityMap) {
 TEST(SolveTransfer, FloorActsOnEveryEntry) {
     // A grey content gives the style root over solveFactor x 15; solveFactor 0 leaves Sc singular,
     // whose LU inverse, and so the map, is zero.
-    const cv::Matx22f root(12, -3, -3, 7);
+    const ColourStats style = MakeStats({12, -3, -3, 7});
     for (float factor : {1.0f, 2.0f, 0.5f}) {
-        EXPECT_LE(MapError(kGrey, MakeStats({12, -3, -3, 7}), root * (1 / (15 * factor)), factor), 1e-5) << factor;
+        EXPECT_LE(MapError(Solve(kGrey, style, factor), cv::Matx22f(style.chromaSqrtCov) / (15 * factor)), 1e-5);
     }
-    EXPECT_EQ(MapError(kGrey, MakeStats({12, -3, -3, 7}), cv::Matx22f(), 0.0f), 0.0);
+    EXPECT_EQ(MapError(Solve(kGrey, style, 0.0f), cv::Matx22f()), 0.0);
     // Element-wise max(Sc, R), not an eigenvalue floor: -5 becomes 0, Sc = 20 I.
-    EXPECT_LE(MapError(MakeStats({20, -5, -5, 20}), MakeStats({25, 6, 6, 18}), cv::Matx22f(25, 6, 6, 18) * 0.05f),
-              1e-5);
+    const TRANSFER floored = Solve(MakeStats({20, -5, -5, 20}), MakeStats({25, 6, 6, 18}));
+    EXPECT_LE(MapError(floored, cv::Matx22f(25, 6, 6, 18) * 0.05f), 1e-5);
 }
 
 TEST(FitToneCurve, CoarseGridIsSevenByEightWithoutNominalEnds) {
