@@ -20,7 +20,7 @@ Table Roots(size_t n, float d) {  // every style d from every other
     return roots;
 }
 
-// Runs the selection on an engine with one cluster per ranking row and the given
+// Runs the selection on an engine with these rankings (one row per cluster) and style
 // distances (roots; the engine stores squares). Returns "styles ... from <clusters>"
 // or the refusal.
 std::string Select(const std::vector<std::vector<int32_t>>& ranking, Table distances, uint64_t n, float factor,
@@ -29,9 +29,7 @@ std::string Select(const std::vector<std::vector<int32_t>>& ranking, Table dista
     for (auto& row : distances) std::transform(row.begin(), row.end(), row.begin(), [](float v) { return v * v; });
     engine.rankedStyles = ranking;
     engine.styleDistances = distances;
-    engine.clusterCount = static_cast<int32_t>(ranking.size());
     engine.styleCount = engine.scoreColumns = static_cast<int32_t>(distances.size());
-    engine.clusterCentres.assign(ranking.size(), ClusterCentre{});
     VoraParameters params;
     params.numTransfers = n;
     params.rankingFactor = factor;
@@ -48,8 +46,8 @@ std::string Refused(Status status) { return "refused " + std::to_string(status) 
 TEST(SelectStyles, ChoosesInScoreOrderKeepingStylesApart) {
     for (float f : {0.0f, 1.0f, 100.0f}) EXPECT_EQ(Select({{3, 1, -1, -1}}, Roots(4, 1), 1, f), "styles 3 from 0") << f;
     EXPECT_EQ(Select({{2, -1, 0, 1}}, Roots(4, 1), 3, 0.0f), "styles 2 0 1 from 0 0 0");  // no diversity: score order
-    // t = 15 skips style 1, only 12 from style 0.
-    EXPECT_EQ(Select({{0, 1, 2}}, {{0, 12, 20}, {12, 0, 20}, {20, 20, 0}}, 2, 1.0f), "styles 0 2 from 0 0");
+    // t = 15 skips style 1, only 14 from style 0, and takes style 2 at exactly 15.
+    EXPECT_EQ(Select({{0, 1, 2}}, {{0, 14, 15}, {14, 0, 15}, {15, 15, 0}}, 2, 1.0f), "styles 0 2 from 0 0");
     // t relaxes 15 -> 12 -> 9.6; at 9.6 style 2 (9 from style 0) still fails and style 1 (10) passes.
     EXPECT_EQ(Select({{0, 2, 1}}, {{0, 10, 9}, {10, 0, 12}, {9, 12, 0}}, 2, 1.0f), "styles 0 1 from 0 0");
     // Two valid entries: once t has shrunk to 0 the chosen ones pass again, in scan order.

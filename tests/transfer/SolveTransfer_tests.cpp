@@ -86,10 +86,8 @@ TEST(FitToneCurve, TargetsLimitTheLargestMoveToPointTwo) {
 }
 
 TEST(FitToneCurve, RecoversAnArctanCurveAndClampsNaN) {
-    const auto arctan = [](double x) {  // a = 0.46, w = 0.34: a point of the fine grid only
-        const double offset = std::atan(0.46 / 0.34);
-        return (std::atan((x - 0.46) / 0.34) + offset) / (offset + std::atan(0.54 / 0.34));
-    };
+    const auto f = [](double x) { return std::atan((x - 0.46) / 0.34); };  // a = 0.46, w = 0.34: fine grid only
+    const auto arctan = [&f](double x) { return (f(x) - f(0)) / (f(1) - f(0)); };
     ColourStats style = kGrey;
     for (int i = 0; i < 32; ++i) style.lightness[i] = static_cast<float>(arctan(kGrey.lightness[i]));
     VoraParameters params;
