@@ -68,7 +68,7 @@ TEST(ApplyTransfer, RefusesGeometryThatWouldEscapeTheBuffers) {
         {image(in, 12), image(nullptr, 12)}, {image(in, 12, 8, 1), image(s, 12, 8, 1)},  // grey
         {image(in, 12, 8, 3, 10), image(s, 12, 8, 3, 10)},  // rows closer than a row of pixels
         {image(in, 12), image(s, 11, 8, 3, 11)}, {image(in, 12), image(s, 12, 7)},  // narrower, shorter
-        {image(in, 12), image(s, 12, 8, 3, 20)}, {image(in, 12), image(s, 12, 8, 4)},  // wider rows, wider pixels
+        {image(in, 12), image(s, 12, 8, 3, 20)}, {image(in, 12), image(s, 12, 8, 4, 9)},  // wider rows, wider pixels
         {image(in, 12, 0, 3, 12, 2), image(s, 12)}, {image(in, 0, 8, 3, 12, 1), image(s, 12)}};  // empty: no error
     for (size_t i = 0; i < std::size(cases); ++i) {
         const Status expected = i >= 10 ? STATUS_OK : STATUS_INVALID_ARGUMENT;
