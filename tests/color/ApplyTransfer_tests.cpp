@@ -137,8 +137,7 @@ TEST(ApplyTransfer, TilesInPlaceAndCopiedRecordsMatchSerialWholeImage) {
         std::shuffle(tiles.begin(), tiles.end(), random);
         cv::Mat source = photo.clone(), separate(photo.size(), CV_8UC3, cv::Scalar::all(0));
         cv::Mat& destination = tiling % 2 ? source : separate;
-        TRANSFER record;
-        record = *std::make_unique<TRANSFER>(Record(true));
+        TRANSFER record = *std::make_unique<TRANSFER>(Record(true));  // a copy whose original is gone
         if (tiling > 1) std::swap(record.faceCorrections[0], record.faceCorrections[1]);  // faces combine by maximum
         testing::internal::CaptureStdout();
         for (const cv::Rect& r : tiles) {

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <utility>
 
 #include "color/ColorTables.h"
 
@@ -20,10 +21,8 @@ TEST(ColorTables, EveryEntryIsItsDoubleFormulaRoundedToFloat) {
 }
 
 TEST(ColorTables, LookupRoundsHalvesUpward) {
-    EXPECT_EQ(TableIndex(0.0f), 0u);
-    EXPECT_EQ(TableIndex(1.0f), 3000u);
-    EXPECT_EQ(TableIndex(0.5f / 3000.0f), 1u);
-    EXPECT_EQ(TableIndex(0.49f / 3000.0f), 0u);
+    const std::pair<float, size_t> cases[] = {{0.0f, 0}, {1.0f, 3000}, {0.5f / 3000.0f, 1}, {0.49f / 3000.0f, 0}};
+    for (const auto& [value, index] : cases) EXPECT_EQ(TableIndex(value), index) << value;
 }
 
 }  // namespace

@@ -18,9 +18,9 @@ cv::Mat Ramp() {
     return lab;
 }
 
-TRANSFER IdentityTransfer() {
-    TRANSFER t;
-    t.chromaMatrix[0] = t.chromaMatrix[3] = t.lightnessHigh = 1.0f;
+// The identity map and curve about these style means.
+TRANSFER IdentityTransfer(float styleA = 0.0f, float styleB = 0.0f) {
+    TRANSFER t{0, 0, {}, {styleA, styleB}, {1, 0, 0, 1}, {}, 0.0f, 1.0f, {}};
     for (int i = 0; i < 257; ++i) t.toneCurve[i] = std::min(1.0f, i / 255.0f);
     return t;
 }
@@ -46,12 +46,10 @@ std::vector<FaceCorrection> Corrections(const std::vector<CFaceRect>& faces, TRA
 }
 
 TEST(FinishTransfer, MeasuresFacesWithASideOfTenAfterTheTransfer) {
-    TRANSFER t = IdentityTransfer();
-    t.styleMean[0] = 5.0f;
-    t.styleMean[1] = -7.0f;
     // 9 x 9 is skipped, 10 x 3 and 3 x 10 are measured, 0 x 12 has no median and is skipped.
     const auto found = Corrections({FaceForSample(10, 10, 9, 9), FaceForSample(40, 20, 10, 3),
-                                    FaceForSample(100, 10, 3, 10), FaceForSample(150, 10, 0, 12)}, t);
+                                    FaceForSample(100, 10, 3, 10), FaceForSample(150, 10, 0, 12)},
+                                   IdentityTransfer(5.0f, -7.0f));
     ASSERT_EQ(found.size(), 2u);
     // Row 15 of 30 sorted pixels: column 45 for L, 44 for b (descending), row 21 for a; 0.09 is under the floor.
     const float expected[8] = {45.5f / 200, 0.22f, 0.025f, 0.015f, 0.045f, 21 + 5, -44 - 7, 0.5f};
