@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <utility>
 
 #include "color/ColorTables.h"
 
@@ -10,9 +11,7 @@ namespace {
 TEST(ColorTables, EveryEntryIsItsDoubleFormulaRoundedToFloat) {
     const float* tables[3] = {gammaTable, inverseGammaTable, labTable};
     const float stated[3][3] = {{0.0f, 0.21763764f, 1.0f}, {0.0f, 0.72974002f, 1.0f}, {0.13793103f, 0.79370052f, 1.0f}};
-    for (int t = 0; t < 3; ++t) {
-        for (int k = 0; k < 3; ++k) EXPECT_EQ(tables[t][k * 1500], stated[t][k]) << t << " entry " << k * 1500;
-    }
+    for (int k = 0; k < 9; ++k) EXPECT_EQ(tables[k / 3][k % 3 * 1500], stated[k / 3][k % 3]) << k;
     for (size_t i = 0; i < kTableSize; ++i) {
         const double x = static_cast<double>(i) / 3000.0;
         ASSERT_EQ(gammaTable[i], static_cast<float>(std::pow(x, 2.2))) << i;
@@ -22,10 +21,8 @@ TEST(ColorTables, EveryEntryIsItsDoubleFormulaRoundedToFloat) {
 }
 
 TEST(ColorTables, LookupRoundsHalvesUpward) {
-    EXPECT_EQ(TableIndex(0.0f), 0u);
-    EXPECT_EQ(TableIndex(1.0f), 3000u);
-    EXPECT_EQ(TableIndex(0.5f / 3000.0f), 1u);
-    EXPECT_EQ(TableIndex(0.49f / 3000.0f), 0u);
+    const std::pair<float, size_t> cases[] = {{0.0f, 0}, {1.0f, 3000}, {0.5f / 3000.0f, 1}, {0.49f / 3000.0f, 0}};
+    for (const auto& [value, index] : cases) EXPECT_EQ(TableIndex(value), index) << value;
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <limits>
 #include <regex>
 #include <string>
@@ -19,20 +20,16 @@ Table Roots(size_t n, float d) {  // every style d from every other
     return roots;
 }
 
-// Runs the selection on an engine with one cluster per ranking row and the given
+// Runs the selection on an engine with these rankings (one row per cluster) and style
 // distances (roots; the engine stores squares). Returns "styles ... from <clusters>"
 // or the refusal.
 std::string Select(const std::vector<std::vector<int32_t>>& ranking, Table distances, uint64_t n, float factor,
                    int32_t nearest = 0) {
     Engine engine;
-    for (auto& row : distances) {
-        for (float& v : row) v *= v;
-    }
+    for (auto& row : distances) std::transform(row.begin(), row.end(), row.begin(), [](float v) { return v * v; });
     engine.rankedStyles = ranking;
     engine.styleDistances = distances;
-    engine.clusterCount = static_cast<int32_t>(ranking.size());
     engine.styleCount = engine.scoreColumns = static_cast<int32_t>(distances.size());
-    engine.clusterCentres.assign(ranking.size(), ClusterCentre{});
     VoraParameters params;
     params.numTransfers = n;
     params.rankingFactor = factor;
@@ -47,12 +44,10 @@ std::string Select(const std::vector<std::vector<int32_t>>& ranking, Table dista
 std::string Refused(Status status) { return "refused " + std::to_string(status) + " from"; }
 
 TEST(SelectStyles, ChoosesInScoreOrderKeepingStylesApart) {
-    for (float factor : {0.0f, 1.0f, 100.0f}) {
-        EXPECT_EQ(Select({{3, 1, -1, -1}}, Roots(4, 1), 1, factor), "styles 3 from 0");  // the best, whatever t
-    }
+    for (float f : {0.0f, 1.0f, 100.0f}) EXPECT_EQ(Select({{3, 1, -1, -1}}, Roots(4, 1), 1, f), "styles 3 from 0") << f;
     EXPECT_EQ(Select({{2, -1, 0, 1}}, Roots(4, 1), 3, 0.0f), "styles 2 0 1 from 0 0 0");  // no diversity: score order
-    // t = 15 skips style 1, only 12 from style 0.
-    EXPECT_EQ(Select({{0, 1, 2}}, {{0, 12, 20}, {12, 0, 20}, {20, 20, 0}}, 2, 1.0f), "styles 0 2 from 0 0");
+    // t = 15 skips style 1, only 14 from style 0, and takes style 2 at exactly 15.
+    EXPECT_EQ(Select({{0, 1, 2}}, {{0, 14, 15}, {14, 0, 15}, {15, 15, 0}}, 2, 1.0f), "styles 0 2 from 0 0");
     // t relaxes 15 -> 12 -> 9.6; at 9.6 style 2 (9 from style 0) still fails and style 1 (10) passes.
     EXPECT_EQ(Select({{0, 2, 1}}, {{0, 10, 9}, {10, 0, 12}, {9, 12, 0}}, 2, 1.0f), "styles 0 1 from 0 0");
     // Two valid entries: once t has shrunk to 0 the chosen ones pass again, in scan order.
@@ -72,15 +67,16 @@ TEST(SelectStyles, RefusesSelectionsThatCouldNeverFinishAndEndsWithExtremeFactor
 }
 
 TEST(OrderClusters, SortsByEuclideanDistance) {
+    // From the origin: 10 off in one coordinate, 1 off in all 512, 3 off in four. The sum of
+    // differences, the largest difference and the Euclidean distance each give another order.
     Engine engine;
     engine.clusterCentres.assign(3, ClusterCentre{});
-    engine.clusterCentres[0].fill(3.0f);
+    engine.clusterCentres[0][7] = 10.0f;
     engine.clusterCentres[1].fill(1.0f);
-    engine.clusterCentres[2].fill(-2.0f);
-    const std::vector<float> feature(512, 0.5f);
+    std::fill_n(engine.clusterCentres[2].begin(), 4, -3.0f);
     std::vector<int32_t> order(3, -1);
-    EXPECT_EQ(OrderClusters(engine, feature.data(), order), 0);
-    EXPECT_EQ(order, std::vector<int32_t>({1, 0, 2}));
+    EXPECT_EQ(OrderClusters(engine, std::vector<float>(512, 0.0f).data(), order), 0);
+    EXPECT_EQ(order, std::vector<int32_t>({2, 0, 1}));
 }
 
 }  // namespace
