@@ -31,6 +31,9 @@ step "Fetching the sample photographs"
 export VORA_QRES_EXTRACT="$root/build/tools/vora-qres-extract"
 timed bash scripts/fetch-photos.sh
 
+step "Fetching the detector network the sample model uses"
+timed bash scripts/fetch-network.sh
+
 vora="$root/build/tools/vora"
 model="$root/.cache/sample-model/"
 if [ "${VORA_REBUILD_MODEL:-0}" = "1" ] || ! "$vora" inspect "$model" >/dev/null 2>&1; then

@@ -16,6 +16,7 @@ echo "== Release build and tests"
 cmake -S . -B build -DCMAKE_BUILD_TYPE=Release -DVORA_BUILD_TESTS=ON -DVORA_BUILD_TOOLS=ON -DVORA_BUILD_BENCHMARKS=ON >/dev/null
 cmake --build build -j "$jobs"
 VORA_QRES_EXTRACT="$root/build/tools/vora-qres-extract" bash scripts/fetch-photos.sh
+bash scripts/fetch-network.sh
 ctest --test-dir build --output-on-failure -j "$jobs"
 
 echo "== Example host against the installed package"
