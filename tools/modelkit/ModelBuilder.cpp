@@ -123,14 +123,15 @@ ColourStats StyleStats(const cv::Mat& bgr8) {
     return stats;
 }
 
-// The pooled features of one image, through the network exactly as the
-// library prepares its input.
-cv::Mat PooledRow(FeatureNetwork& network, const cv::Mat& bgr8) {
+// The network's output for one image, its input prepared exactly as the
+// library prepares it.
+cv::Mat PooledRow(FeatureNetwork& network, const cv::Mat& bgr8, int size) {
     cv::Mat canvas;
     PrepareNetworkImage(bgr8, canvas, kNetworkImageSize, kNetworkInputSize);
     const std::vector<float> pooled = network.Forward(canvas);
-    if (pooled.size() != static_cast<size_t>(PooledFeatureSize()))
-        throw std::runtime_error("the scene descriptor network gave an output of unexpected size");
+    if (pooled.size() != static_cast<size_t>(size))
+        throw std::runtime_error("the feature network gave " + std::to_string(pooled.size()) + " values instead of " +
+                                 std::to_string(size));
     return cv::Mat(pooled, true).reshape(1, 1);
 }
 
@@ -199,48 +200,56 @@ void BuildModel(const BuildModelOptions& options) {
     }
 
     Staging staging(options.outDir);
-    const fs::path pooledDir = staging.path() / "pooled";
-    WriteNetworkFiles(PooledFeatureNetwork(), pooledDir.string());
+    // A given network is the model's own and its output the feature; the
+    // scene descriptor's pooled values are mapped by a fit made below.
+    const bool fixedNetwork = options.network != nullptr;
+    const fs::path pooledDir = staging.path() / (fixedNetwork ? "net" : "pooled");
+    WriteNetworkFiles(fixedNetwork ? *options.network : PooledFeatureNetwork(), pooledDir.string());
     std::unique_ptr<FeatureNetwork> pooledNet =
         FeatureNetwork::Load((pooledDir / kNetworkDefinitionName).string(), (pooledDir / kNetworkWeightsName).string());
+    const int pooledSize = fixedNetwork ? kDescriptorSize : PooledFeatureSize();
 
     // Style records, each style's own pooled feature, and the content samples.
     const int styleCount = static_cast<int>(stylePaths.size());
     const double photoCount = static_cast<double>(stylePaths.size() + contentPaths.size());
     std::vector<ColourStats> styles(stylePaths.size());
-    cv::Mat stylePooled(0, PooledFeatureSize(), CV_32F);
-    cv::Mat contentPooled(0, PooledFeatureSize(), CV_32F);
+    cv::Mat stylePooled(0, pooledSize, CV_32F);
+    cv::Mat contentPooled(0, pooledSize, CV_32F);
     for (int s = 0; s < styleCount; ++s) {
         Report(options, 0.8 * s / photoCount, "reading " + fs::path(stylePaths[s]).filename().string());
         const cv::Mat photo = ReadPhoto(stylePaths[s]);
         styles[s] = StyleStats(photo);
-        stylePooled.push_back(PooledRow(*pooledNet, photo));
+        stylePooled.push_back(PooledRow(*pooledNet, photo, pooledSize));
         if (contentPaths.empty()) {
             contentPooled.push_back(stylePooled.row(s));
-            for (Alteration alteration : AllAlterations()) contentPooled.push_back(PooledRow(*pooledNet, Alter(photo, alteration)));
+            for (Alteration alteration : AllAlterations()) contentPooled.push_back(PooledRow(*pooledNet, Alter(photo, alteration), pooledSize));
         }
     }
     for (size_t c = 0; c < contentPaths.size(); ++c) {
         Report(options, 0.8 * (styleCount + c) / photoCount, "reading " + fs::path(contentPaths[c]).filename().string());
-        contentPooled.push_back(PooledRow(*pooledNet, ReadPhoto(contentPaths[c])));
+        contentPooled.push_back(PooledRow(*pooledNet, ReadPhoto(contentPaths[c]), pooledSize));
     }
     pooledNet.reset();
 
     // The final map of the descriptor, fitted on every photo seen.
-    Report(options, 0.8, "fitting the scene descriptor");
-    cv::Mat fitRows = contentPooled.clone();
-    if (!contentPaths.empty()) fitRows.push_back(stylePooled);
-    const Projection projection = FitProjection(fitRows);
-    auto describe = [&](const cv::Mat& pooled) {
-        cv::Mat out(pooled.rows, kDescriptorSize, CV_32F);
-        for (int r = 0; r < pooled.rows; ++r) {
-            const std::vector<float> row = Project(projection, pooled.ptr<float>(r));
-            std::memcpy(out.ptr<float>(r), row.data(), row.size() * sizeof(float));
-        }
-        return out;
-    };
-    const cv::Mat styleFeatures = describe(stylePooled);
-    const cv::Mat contentFeatures = describe(contentPooled);
+    Projection projection;
+    cv::Mat styleFeatures = stylePooled, contentFeatures = contentPooled;
+    if (!fixedNetwork) {
+        Report(options, 0.8, "fitting the scene descriptor");
+        cv::Mat fitRows = contentPooled.clone();
+        if (!contentPaths.empty()) fitRows.push_back(stylePooled);
+        projection = FitProjection(fitRows);
+        auto describe = [&](const cv::Mat& pooled) {
+            cv::Mat out(pooled.rows, kDescriptorSize, CV_32F);
+            for (int r = 0; r < pooled.rows; ++r) {
+                const std::vector<float> row = Project(projection, pooled.ptr<float>(r));
+                std::memcpy(out.ptr<float>(r), row.data(), row.size() * sizeof(float));
+            }
+            return out;
+        };
+        styleFeatures = describe(stylePooled);
+        contentFeatures = describe(contentPooled);
+    }
 
     // Semantic clusters of the content samples.
     Report(options, 0.85, "clustering " + std::to_string(samples) + " samples into " + std::to_string(clusters));
@@ -289,7 +298,7 @@ void BuildModel(const BuildModelOptions& options) {
         }
         file.Close();
     }
-    WriteNetworkFiles(DescriptorNetwork(projection), (stage / "net").string());
+    if (!fixedNetwork) WriteNetworkFiles(DescriptorNetwork(projection), (stage / "net").string());
 
     const std::string net = kNetworkFolder;
     staging.Publish({kClusterFileName, kStyleFileName, kScoresFileName, kDistanceFileName,

@@ -4,7 +4,10 @@
 // network) from a folder of style photographs.
 
 #include <functional>
+#include <memory>
 #include <string>
+
+#include "modelkit/SceneDescriptor.h"
 
 namespace vora {
 namespace modelkit {
@@ -14,6 +17,9 @@ struct BuildModelOptions {
     std::string contentDir;  // content photographs for clustering; empty: the styles and altered copies
     std::string outDir;      // model directory to write
     int clusters = 0;        // 0: a sensible default from the sample count (at most 1000)
+    // A ready feature network (512 outputs, taken as they are); null: the
+    // scene descriptor, its final map fitted on the photos.
+    std::shared_ptr<const NetworkFiles> network;
     // Called with the fraction done (0..1) and what is being done now.
     std::function<void(double, const std::string&)> progress;
 };

@@ -330,7 +330,7 @@ void WriteNetworkFiles(const NetworkFiles& network, const std::string& dir) {
     const std::string definition = dir + "/" + kNetworkDefinitionName;
     const std::string weights = dir + "/" + kNetworkWeightsName;
     WriteText(definition, network.definition);
-    if (!WriteWeightsFile(weights, "vora_scene_descriptor", network.weights))
+    if (!WriteWeightsFile(weights, network.name, network.weights))
         throw std::runtime_error("cannot write " + weights);
 }
 

@@ -40,6 +40,7 @@ extern const char* const kDescriptorTop;  // "descriptor"
 struct NetworkFiles {
     std::string definition;
     std::vector<WeightsLayer> weights;
+    std::string name = "vora_scene_descriptor";  // the weights file's net name
 };
 
 // The final linear map: descriptor = weights * features + bias, weights row
