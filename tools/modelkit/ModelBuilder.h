@@ -17,11 +17,11 @@ struct BuildModelOptions {
     std::string contentDir;  // content photographs for clustering; empty: the styles and altered copies
     std::string outDir;      // model directory to write
     int clusters = 0;        // 0: a sensible default from the sample count (at most 1000)
+    // Called with the fraction done (0..1) and what is being done now.
+    std::function<void(double, const std::string&)> progress;
     // A ready feature network (512 outputs, taken as they are); null: the
     // scene descriptor, its final map fitted on the photos.
     std::shared_ptr<const NetworkFiles> network;
-    // Called with the fraction done (0..1) and what is being done now.
-    std::function<void(double, const std::string&)> progress;
 };
 
 // Writes outDir/{four .dat files} and outDir/net/{deploy2.prototxt,

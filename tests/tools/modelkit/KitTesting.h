@@ -46,7 +46,7 @@ inline cv::Mat Scene(int seed, int rows = 96, int cols = 128) {
 }
 
 inline void Build(const fs::path& styles, const fs::path& out, int clusters = 0, const fs::path& content = {}) {
-    vora::modelkit::BuildModel({styles.string(), content.string(), out.string(), clusters, {}});
+    vora::modelkit::BuildModel({styles.string(), content.string(), out.string(), clusters, {}, nullptr});
 }
 
 }  // namespace kit_testing

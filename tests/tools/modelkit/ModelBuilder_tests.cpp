@@ -53,7 +53,7 @@ struct Built {
     Engine engine;
     Built() {
         BuildModel({styles.path.string(), "", model.path.string(), 0,
-                    [this](double fraction, const std::string&) { progress.push_back(fraction); }});
+                    [this](double fraction, const std::string&) { progress.push_back(fraction); }, nullptr});
         engine.LoadModel(model.path.string() + "/");
     }
 };
