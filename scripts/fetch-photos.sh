@@ -1,9 +1,12 @@
 #!/usr/bin/env bash
 # Fetches the sample photographs from Debian's archive into .cache/ (never
 # committed) and lays them out for the sample model and the demo:
-#   .cache/photos/styles/   graded wallpapers and the photographs of an
-#                           educational data package (style photos)
+#   .cache/photos/styles/   graded wallpapers, sample photographs and the
+#                           photographs of an educational data package
+#                           (style photos)
 #   .cache/photos/content/  two public-domain portraits (content photos)
+#   .cache/photos/eval/<subject>/  the labelled evaluation set listed in
+#                           tests/data/eval-set.tsv, kept out of the styles
 # Credits and licences: docs/photo-credits.md. Safe to run again: a complete
 # layout is left alone, and downloaded packages are kept in .cache/debs/.
 #
@@ -16,7 +19,7 @@ debs="$cache/debs"
 unpacked="$cache/unpacked"
 photos="$cache/photos"
 # Bump when the selection below changes, so an old layout is redone.
-layout_version="1"
+layout_version="2"
 stamp="$photos/.complete-$layout_version"
 
 if [ -f "$stamp" ]; then
@@ -25,11 +28,15 @@ fi
 
 fail() { echo "fetch-photos: $*" >&2; exit 1; }
 
-packages=(lomiri-wallpapers-16.04 gcompris-qt-data python3-imageio python-matplotlib-data)
+packages=(lomiri-wallpapers-16.04 lomiri-wallpapers-20.04 mate-backgrounds plasma-workspace-wallpapers
+          palapeli-data python3-skimage gcompris-qt-data python3-imageio python-matplotlib-data)
 
 # Activities of the data package whose images are photographs; the others
 # hold drawings, icons and paintings.
 activities=(erase explore_farm_animals explore_monuments explore_world_animals explore_world_music clickgame)
+# Archives unpacked whole: the evaluation set takes some of their photographs.
+eval_activities=(categorization details louis-braille explore_world_music)
+eval_list="$root/tests/data/eval-set.tsv"
 
 mkdir -p "$debs"
 missing=()
@@ -66,34 +73,86 @@ fi
 
 staging="$photos.new"
 rm -rf "$staging"
-mkdir -p "$staging/styles" "$staging/content"
+mkdir -p "$staging/styles" "$staging/content" "$staging/eval"
+rcc="$unpacked/gcompris-qt-data/usr/share/gcompris-qt/rcc"
+
+# The evaluation set first. Its photographs are kept out of the styles by
+# content, since one picture may sit in two packages or two activities.
+for a in "${eval_activities[@]}"; do
+    [ -f "$rcc/$a.rcc" ] || fail "missing $rcc/$a.rcc"
+    "$extract" "$rcc/$a.rcc" "$unpacked/gcompris-rcc/$a" >/dev/null || fail "cannot extract $rcc/$a.rcc"
+done
+[ -f "$eval_list" ] || fail "missing $eval_list"
+declare -A seen=()
+count=0
+while IFS=$'\t' read -r subject name source; do
+    case "$subject" in '' | '#'*) continue ;; esac
+    [ -f "$unpacked/$source" ] || fail "missing $source, listed in $eval_list"
+    mkdir -p "$staging/eval/$subject"
+    cp "$unpacked/$source" "$staging/eval/$subject/$name"
+    seen[$(sha256sum "$unpacked/$source" | cut -c1-64)]=1
+    count=$((count + 1))
+done <"$eval_list"
+[ "$count" -ge 80 ] || fail "expected at least 80 photos in $eval_list, found $count"
+
+styles=0
+add_style() { # FILE NAME: copies FILE to styles/NAME unless the picture is there already
+    local sum
+    sum=$(sha256sum "$1" | cut -c1-64)
+    [ -z "${seen[$sum]:-}" ] || return 0
+    seen[$sum]=1
+    cp "$1" "$staging/styles/$2"
+    styles=$((styles + 1))
+}
 
 # Graded wallpapers.
 wallpapers="$unpacked/lomiri-wallpapers-16.04/usr/share/backgrounds"
 count=0
 for f in "$wallpapers"/*.jpg; do
     [ -f "$f" ] || continue
-    cp "$f" "$staging/styles/wall-$(basename "$f")"
+    add_style "$f" "wall-$(basename "$f")"
     count=$((count + 1))
 done
 [ "$count" -ge 14 ] || fail "expected at least 14 wallpapers in $wallpapers, found $count"
 
+# Photographs among the other wallpapers and sample data (the rest are
+# drawings and renders), chosen for subjects the others lack: plants, water,
+# night, food. Listed as "package path name".
+samples=(
+    "lomiri-wallpapers-20.04 usr/share/backgrounds/Infinite-Sea_by_Aury88.jpg wall-Infinite-Sea_by_Aury88.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/Aqua.jpg mate-Aqua.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/Garden.jpg mate-Garden.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/GreenMeadow.jpg mate-GreenMeadow.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/LadyBird.jpg mate-LadyBird.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/Storm.jpg mate-Storm.jpg"
+    "mate-backgrounds usr/share/backgrounds/mate/nature/Wood.jpg mate-Wood.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/ColorfulCups/contents/images/2560x1600.jpg plasma-ColorfulCups.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/DarkestHour/contents/images/1920x1080.jpg plasma-DarkestHour.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/EveningGlow/contents/images/1920x1080.jpg plasma-EveningGlow.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/FallenLeaf/contents/images/1920x1080.jpg plasma-FallenLeaf.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/Grey/contents/images/1920x1080.jpg plasma-Grey.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/Path/contents/images/1920x1080.jpg plasma-Path.jpg"
+    "plasma-workspace-wallpapers usr/share/wallpapers/summer_1am/contents/images/1920x1080.jpg plasma-summer_1am.jpg"
+    "palapeli-data usr/share/palapeli/collection/castle-maintenon.jpg palapeli-castle-maintenon.jpg"
+    "palapeli-data usr/share/palapeli/collection/citrus-fruits.jpg palapeli-citrus-fruits.jpg"
+    "palapeli-data usr/share/palapeli/collection/european-honey-bee.jpg palapeli-european-honey-bee.jpg"
+)
+for entry in "${samples[@]}"; do
+    read -r package path name <<<"$entry"
+    [ -f "$unpacked/$package/$path" ] || fail "missing $path in $package"
+    add_style "$unpacked/$package/$path" "$name"
+done
+
 # Photographs inside the data package's resource archives.
-rcc="$unpacked/gcompris-qt-data/usr/share/gcompris-qt/rcc"
 extracted="$unpacked/gcompris-photos"
 for a in "${activities[@]}"; do
     [ -f "$rcc/$a.rcc" ] || fail "missing $rcc/$a.rcc"
     "$extract" "$rcc/$a.rcc" "$extracted/$a" --photos || fail "cannot extract $rcc/$a.rcc"
 done
 count=0
-declare -A seen=()
 while IFS= read -r -d '' f; do
-    # The same picture may serve two activities: keep it once.
-    sum=$(sha256sum "$f" | cut -c1-64)
-    [ -z "${seen[$sum]:-}" ] || continue
-    seen[$sum]=1
     activity=$(realpath --relative-to="$extracted" "$f" | cut -d/ -f1)
-    cp "$f" "$staging/styles/gc-$activity-$(basename "$f")"
+    add_style "$f" "gc-$activity-$(basename "$f")"
     count=$((count + 1))
 done < <(find "$extracted" -type f -print0 | sort -z)
 [ "$count" -ge 100 ] || fail "expected about 120 photographs in the data package, found $count"
@@ -108,4 +167,5 @@ cp "$astronaut" "$hopper" "$staging/content/"
 rm -rf "$photos"
 mv "$staging" "$photos"
 touch "$stamp"
-echo "fetch-photos: $(ls "$photos/styles" | wc -l) style photos and $(ls "$photos/content" | wc -l) content photos in $photos"
+echo "fetch-photos: $styles style photos, $(ls "$photos/content" | wc -l) content photos and" \
+    "$(find "$photos/eval" -type f | wc -l) evaluation photos in $photos"

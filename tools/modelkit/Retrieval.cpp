@@ -24,7 +24,24 @@ struct Copy {
     std::vector<float> feature;
 };
 
-std::vector<float> Feature(FeatureNetwork& network, const cv::Mat& bgr8) {
+double SquaredDistance(const std::vector<float>& a, const std::vector<float>& b) {
+    double sum = 0.0;
+    for (size_t i = 0; i < a.size(); ++i) sum += (double(a[i]) - b[i]) * (double(a[i]) - b[i]);
+    return sum;
+}
+
+}  // namespace
+
+std::unique_ptr<FeatureNetwork> LoadModelNetwork(const std::string& modelDir) {
+    const fs::path net = fs::path(modelDir) / kNetworkFolder;
+    try {
+        return FeatureNetwork::Load((net / kNetworkDefinitionName).string(), (net / kNetworkWeightsName).string());
+    } catch (const cv::Exception& e) {
+        throw std::runtime_error("cannot load the network of " + modelDir + ": " + e.what());
+    }
+}
+
+std::vector<float> PhotoFeature(FeatureNetwork& network, const cv::Mat& bgr8) {
     cv::Mat canvas;
     PrepareNetworkImage(bgr8, canvas, kNetworkImageSize, kNetworkInputSize);
     std::vector<float> out = network.Forward(canvas);
@@ -34,32 +51,18 @@ std::vector<float> Feature(FeatureNetwork& network, const cv::Mat& bgr8) {
     return out;
 }
 
-double SquaredDistance(const std::vector<float>& a, const std::vector<float>& b) {
-    double sum = 0.0;
-    for (size_t i = 0; i < a.size(); ++i) sum += (double(a[i]) - b[i]) * (double(a[i]) - b[i]);
-    return sum;
-}
-
-}  // namespace
-
 RetrievalResult MeasureRetrieval(const std::string& modelDir, const std::vector<std::string>& photoPaths,
                                  const std::function<void(double, const std::string&)>& progress) {
-    const fs::path net = fs::path(modelDir) / kNetworkFolder;
-    std::unique_ptr<FeatureNetwork> network;
-    try {
-        network = FeatureNetwork::Load((net / kNetworkDefinitionName).string(), (net / kNetworkWeightsName).string());
-    } catch (const cv::Exception& e) {
-        throw std::runtime_error("cannot load the network of " + modelDir + ": " + e.what());
-    }
+    const std::unique_ptr<FeatureNetwork> network = LoadModelNetwork(modelDir);
 
     const auto& alterations = AllAlterations();
     std::vector<Copy> copies;
     for (size_t p = 0; p < photoPaths.size(); ++p) {
         if (progress) progress(double(p) / photoPaths.size(), fs::path(photoPaths[p]).filename().string());
         const cv::Mat photo = ReadPhoto(photoPaths[p]);
-        copies.push_back({int(p), -1, Feature(*network, photo)});
+        copies.push_back({int(p), -1, PhotoFeature(*network, photo)});
         for (size_t a = 0; a < alterations.size(); ++a)
-            copies.push_back({int(p), int(a), Feature(*network, Alter(photo, alterations[a]))});
+            copies.push_back({int(p), int(a), PhotoFeature(*network, Alter(photo, alterations[a]))});
     }
 
     RetrievalResult result;

@@ -7,11 +7,26 @@
 // copy of the same photo.
 
 #include <functional>
+#include <memory>
 #include <string>
 #include <vector>
 
+#include <opencv2/core.hpp>
+
 namespace vora {
+
+class FeatureNetwork;
+
 namespace modelkit {
+
+// The network of a model directory (its net/ folder), loaded as the library
+// loads it. Throws std::runtime_error naming the directory when it cannot be.
+std::unique_ptr<FeatureNetwork> LoadModelNetwork(const std::string& modelDir);
+
+// A photo's 512 feature values, computed as the library computes them
+// (network input canvas, one forward pass, the first 512 outputs). Throws
+// std::runtime_error when the network gives fewer.
+std::vector<float> PhotoFeature(FeatureNetwork& network, const cv::Mat& bgr8);
 
 struct RetrievalResult {
     int photos = 0;
