@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
-# The demo: installs what is missing, builds, fetches the sample photographs,
-# builds the sample model once (cached in .cache/sample-model/), and proposes
+# The demo: installs what is missing, builds, fetches the sample photographs
+# and the detector network whose features group them by subject, builds the
+# sample model once (cached in .cache/sample-model/), and proposes
 # styles for the astronaut photo with its face detected. Prints where the
 # contact sheet is. A second run reuses the build, the photos and the model.
 #
@@ -36,9 +37,11 @@ timed bash scripts/fetch-network.sh
 
 vora="$root/build/tools/vora"
 model="$root/.cache/sample-model/"
-if [ "${VORA_REBUILD_MODEL:-0}" = "1" ] || ! "$vora" inspect "$model" >/dev/null 2>&1; then
+# A model left by an older demo, built with the scene descriptor, is rebuilt.
+if [ "${VORA_REBUILD_MODEL:-0}" = "1" ] || ! "$vora" inspect "$model" >/dev/null 2>&1 ||
+    ! grep -q vora_nanodet_backbone "$model/net/deploy2.prototxt"; then
     step "Building the sample model from $(ls .cache/photos/styles | wc -l) style photos"
-    timed "$vora" build-model --styles .cache/photos/styles --out "$model" --force
+    timed "$vora" build-model --styles .cache/photos/styles --network nanodet --out "$model" --force
 else
     step "Reusing the sample model in .cache/sample-model/"
 fi
