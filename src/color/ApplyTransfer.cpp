@@ -1,5 +1,8 @@
 // Applying a transfer to a whole image or a tile: geometry and face boxes are
-// prepared once, then a plain per-pixel kernel runs over bands of whole rows.
+// prepared once, then a kernel runs over bands of whole rows. Two kernels give
+// the same bytes: the plain per-pixel chain, and one that evaluates the chain
+// once per distinct colour (outside face boxes a pixel's output depends on its
+// colour alone) through a small per-thread cache.
 #include "color/ApplyTransfer.h"
 
 #include <algorithm>
@@ -7,6 +10,7 @@
 #include <cstdio>
 
 #include <tbb/blocked_range2d.h>
+#include <tbb/enumerable_thread_specific.h>
 #include <tbb/parallel_for.h>
 #include <tbb/partitioner.h>
 #include <tbb/task_group.h>
@@ -85,6 +89,90 @@ void RunBand(const ApplyTransferWorker& worker, size_t rowBegin, size_t rowEnd, 
     }
 }
 
+// The output of a pixel outside every face box, packed as R << 16 | G << 8 | B:
+// the plain kernel's chain without the face step.
+inline uint32_t TransferColour(const TRANSFER& transfer, uint8_t red, uint8_t green, uint8_t blue) {
+    const LabPixel lab = RgbToLab(red, green, blue);
+    const float lightness = ToneCurveLookup(
+        transfer.toneCurve, NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
+    const ChromaPixel chroma = MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
+    const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
+    return static_cast<uint32_t>(rgb.red) << 16 | static_cast<uint32_t>(rgb.green) << 8 | rgb.blue;
+}
+
+}  // namespace
+
+ColourCache::ColourCache(unsigned bits) : m_shift(32 - bits), m_entries(size_t{1} << bits, 0) {}
+
+unsigned ColourCacheBits(size_t pixels) {
+    if (pixels < kColourCacheMinPixels) return 0;
+    // About one entry for every 16 pixels: a tile pays for its own size only.
+    unsigned bits = 0;
+    while (bits < kColourCacheMaxBits && (size_t{16} << bits) < pixels) ++bits;
+    return std::max(bits, kColourCacheMinBits);
+}
+
+namespace {
+
+// The cached kernel. Rows that meet no face box take every pixel from the
+// cache; in rows that do, pixels inside a box take the plain chain with the
+// faces whose boxes meet the row, in record order (the others cannot contain
+// the pixel, so the maximum over faces is unchanged).
+void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t rowBegin, size_t rowEnd,
+                   size_t columnBegin, size_t columnEnd) {
+    const TRANSFER& transfer = worker.transfer;
+    const size_t faceCount = worker.faceBoxes ? std::min(worker.faceCount, transfer.faceCorrections.size()) : 0;
+    const size_t pixelStride = worker.pixelStride;
+    std::vector<FaceBox> rowBoxes;
+    std::vector<FaceCorrection> rowFaces;
+    rowBoxes.reserve(faceCount);
+    rowFaces.reserve(faceCount);
+
+    for (size_t r = rowBegin; r < rowEnd; ++r) {
+        rowBoxes.clear();
+        rowFaces.clear();
+        const float py = faceCount > 0 ? FullImagePosition(worker.tileTop, r, worker.fullHeight) : 0.0f;
+        for (size_t i = 0; i < faceCount; ++i) {
+            const FaceBox& box = worker.faceBoxes[i];
+            if (py > box.yLow && py < box.yHigh) {
+                rowBoxes.push_back(box);
+                rowFaces.push_back(transfer.faceCorrections[i]);
+            }
+        }
+        const size_t offset = r * worker.rowStride + columnBegin * pixelStride;
+        const uint8_t* in = worker.source + offset;
+        uint8_t* out = worker.destination + offset;
+        for (size_t c = columnBegin; c < columnEnd; ++c, in += pixelStride, out += pixelStride) {
+            const uint8_t red = in[0], green = in[1], blue = in[2];
+            if (!rowBoxes.empty()) {
+                const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
+                bool inside = false;
+                for (const FaceBox& box : rowBoxes) inside = inside || (px > box.xLow && px < box.xHigh);
+                if (inside) {
+                    const LabPixel lab = RgbToLab(red, green, blue);
+                    const float base = ToneCurveLookup(
+                        transfer.toneCurve,
+                        NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
+                    const ChromaPixel chroma =
+                        MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
+                    const float lightness = LiftFaces(rowBoxes.data(), rowFaces.data(), rowBoxes.size(), px, py,
+                                                      base, chroma.a, chroma.b);
+                    const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
+                    out[0] = rgb.red;
+                    out[1] = rgb.green;
+                    out[2] = rgb.blue;
+                    continue;
+                }
+            }
+            const uint32_t key = static_cast<uint32_t>(red) << 16 | static_cast<uint32_t>(green) << 8 | blue;
+            const uint32_t rgb = cache.Get(key, [&] { return TransferColour(transfer, red, green, blue); });
+            out[0] = static_cast<uint8_t>(rgb >> 16);
+            out[1] = static_cast<uint8_t>(rgb >> 8);
+            out[2] = static_cast<uint8_t>(rgb);
+        }
+    }
+}
+
 enum class Threading { Parallel, Serial };
 
 // Input outside the contract that the kernel would turn into out-of-bounds
@@ -103,7 +191,8 @@ bool GeometryIsUsable(const IImage& source, const IImage& destination) {
     return source.GetWidth() <= source.GetRowStride() / pixelStride;
 }
 
-Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, Threading threading) {
+Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, Threading threading,
+             ApplyKernel kernel) {
     if (source == nullptr || destination == nullptr) return STATUS_INVALID_ARGUMENT;
 
     const size_t rows = source->GetHeight();
@@ -122,7 +211,7 @@ Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination
 
     if (empty) return STATUS_OK;
 
-    const ApplyTransferWorker worker{rows,
+    ApplyTransferWorker worker{rows,
                                      columns,
                                      source->GetRowStride(),
                                      source->GetPixelStride(),
@@ -134,7 +223,13 @@ Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination
                                      fullResSize.width,
                                      fullResSize.height,
                                      faceBoxes.size(),
-                                     faceBoxes.data()};
+                                     faceBoxes.data(),
+                                     nullptr};
+
+    // The cache is sized by the work of this call and lives only as long as it.
+    const unsigned cacheBits = kernel == ApplyKernel::Plain ? 0 : ColourCacheBits(rows * columns);
+    tbb::enumerable_thread_specific<ColourCache> caches([cacheBits] { return ColourCache(cacheBits); });
+    if (cacheBits > 0) worker.caches = &caches;
 
     if (threading == Threading::Serial) {
         worker.Run(0, rows, 0, columns);
@@ -165,6 +260,10 @@ std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer) {
 }
 
 void ApplyTransferWorker::Run(size_t rowBegin, size_t rowEnd, size_t columnBegin, size_t columnEnd) const {
+    if (caches != nullptr) {
+        RunBandCached(*this, caches->local(), rowBegin, rowEnd, columnBegin, columnEnd);
+        return;
+    }
     // A worker never reads past the face entries of its own record.
     if (std::min(faceCount, transfer.faceCorrections.size()) > 0 && faceBoxes != nullptr) {
         RunBand<true>(*this, rowBegin, rowEnd, columnBegin, columnEnd);
@@ -173,12 +272,12 @@ void ApplyTransferWorker::Run(size_t rowBegin, size_t rowEnd, size_t columnBegin
     }
 }
 
-Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination) {
-    return Apply(source, transfer, destination, Threading::Parallel);
+Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
+    return Apply(source, transfer, destination, Threading::Parallel, kernel);
 }
 
-Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination) {
-    return Apply(source, transfer, destination, Threading::Serial);
+Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
+    return Apply(source, transfer, destination, Threading::Serial, kernel);
 }
 
 }  // namespace vora

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <vector>
 
+#include <tbb/enumerable_thread_specific.h>
 #include <vora/vora.h>
 
 namespace vora {
@@ -15,6 +16,44 @@ struct FaceBox {
     double yLow;
     double yHigh;
 };
+
+// A direct-mapped cache of the colour function of a transfer outside face
+// boxes: 2^bits entries of 8 bytes, each a 24-bit colour (tagged) and its
+// 24-bit output. A miss overwrites the entry, so the memory is fixed.
+class ColourCache {
+public:
+    explicit ColourCache(unsigned bits);  // 1 <= bits <= 31
+
+    template <class Compute>
+    uint32_t Get(uint32_t colour, Compute&& compute) {
+        uint64_t& entry = m_entries[(colour * 0x9E3779B1u) >> m_shift];
+        const uint32_t tag = colour | 0x80000000u;  // never 0, the empty entry
+        if (static_cast<uint32_t>(entry >> 32) == tag) return static_cast<uint32_t>(entry);
+        const uint32_t value = compute();
+        entry = static_cast<uint64_t>(tag) << 32 | value;
+        return value;
+    }
+
+private:
+    unsigned m_shift;
+    std::vector<uint64_t> m_entries;
+};
+
+// Below this many pixels a call runs the plain kernel: filling a cache would
+// cost more than it saves.
+constexpr size_t kColourCacheMinPixels = size_t{1} << 15;
+constexpr unsigned kColourCacheMinBits = 10;
+// 2^18 entries: 2 MiB per thread, the most a call keeps.
+constexpr unsigned kColourCacheMaxBits = 18;
+
+// The cache size for a call over `pixels` pixels: 0 (no cache) below
+// kColourCacheMinPixels, else about one entry for every 16 pixels, within
+// [kColourCacheMinBits, kColourCacheMaxBits].
+unsigned ColourCacheBits(size_t pixels);
+
+// Which kernel apply runs. Both give the same bytes; Plain is the
+// straightforward per-pixel form, kept as the reference the other is held to.
+enum class ApplyKernel { Fastest, Plain };
 
 // Builds one box per face correction (centre +- 2.5 half-sizes, in float, then widened).
 std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer);
@@ -35,6 +74,8 @@ struct ApplyTransferWorker {
     size_t fullHeight;
     size_t faceCount;
     const FaceBox* faceBoxes;
+    // Per-thread colour caches; null runs the plain kernel.
+    tbb::enumerable_thread_specific<ColourCache>* caches;
 
     // Rewrites rows [rowBegin, rowEnd) and columns [columnBegin, columnEnd).
     void Run(size_t rowBegin, size_t rowEnd, size_t columnBegin, size_t columnEnd) const;
@@ -57,9 +98,15 @@ struct ApplyTransferWorker {
 // pixel pointer; a destination whose width, height, row stride or pixel
 // stride differs from the source's; a pixel stride below 3; a row stride
 // shorter than a row of pixels.
-Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination);
+//
+// A call over at least kColourCacheMinPixels pixels keeps, per thread that
+// takes part, a colour cache of 8 << ColourCacheBits(pixels) bytes (at most
+// 2 MiB), freed before it returns.
+Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination,
+                     ApplyKernel kernel = ApplyKernel::Fastest);
 
 // The same work on the calling thread only (for tests and thread-free callers).
-Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination);
+Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination,
+                           ApplyKernel kernel = ApplyKernel::Fastest);
 
 }  // namespace vora

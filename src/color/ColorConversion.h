@@ -10,6 +10,12 @@
 
 #include "color/ColorTables.h"
 
+// Fast math would reorder and fuse the operations whose rounding this file
+// pins; every target including it is built with -ffp-contract=off as well.
+#ifdef __FAST_MATH__
+#error "the colour conversions must not be compiled with fast math"
+#endif
+
 namespace vora {
 
 // Bit-exact constants (hex literals, so no decimal reading can round them).

@@ -46,8 +46,10 @@ TRANSFER Record(bool styled, bool faces = true) {
 cv::Mat ApplyWhole(const cv::Mat& source, const TRANSFER& transfer, bool serial = false) {
     cv::Mat in = source.clone(), out(source.size(), source.type(), cv::Scalar::all(7));
     testing::internal::CaptureStdout();
-    const auto apply = serial ? ApplyTransferSerial : ApplyTransfer;
-    EXPECT_EQ(apply(testimages::ImageHandle(in).get(), transfer, testimages::ImageHandle(out).get()), STATUS_OK);
+    const testimages::ImageHandle inHandle(in), outHandle(out);
+    EXPECT_EQ(serial ? ApplyTransferSerial(inHandle.get(), transfer, outHandle.get())
+                     : ApplyTransfer(inHandle.get(), transfer, outHandle.get()),
+              STATUS_OK);
     const size_t faces = transfer.faceCorrections.size();
     EXPECT_EQ(testing::internal::GetCapturedStdout(), faces ? "Correct " + std::to_string(faces) + " faces!!\n" : "");
     return out;

@@ -124,9 +124,12 @@ TEST(ColourKnownAnswers, TransferOfOnePixel) {
         cv::Mat source(1, kCount, CV_8UC3);
         for (size_t i = 0; i < kCount; ++i)
             source.at<cv::Vec3b>(0, i) = cv::Vec3b(answers[i].in[0], answers[i].in[1], answers[i].in[2]);
-        for (const auto apply : {ApplyTransfer, ApplyTransferSerial}) {
+        for (const bool serial : {false, true}) {
             cv::Mat in = source.clone(), out(source.size(), CV_8UC3, cv::Scalar::all(7));
-            ASSERT_EQ(apply(testimages::ImageHandle(in).get(), transfer, testimages::ImageHandle(out).get()), STATUS_OK);
+            const testimages::ImageHandle inHandle(in), outHandle(out);
+            ASSERT_EQ(serial ? ApplyTransferSerial(inHandle.get(), transfer, outHandle.get())
+                             : ApplyTransfer(inHandle.get(), transfer, outHandle.get()),
+                      STATUS_OK);
             for (size_t i = 0; i < kCount; ++i) {
                 const cv::Vec3b got = out.at<cv::Vec3b>(0, i);
                 EXPECT_EQ((std::array<int, 3>{got[0], got[1], got[2]}), answers[i].out)
