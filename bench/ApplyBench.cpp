@@ -3,10 +3,8 @@
 // fastest one; beside them, in the same run, OpenCV's own 8-bit RGB -> Lab ->
 // RGB round trip (the peer) and a memcpy of the image (the floor).
 //
-// The photo is the largest sample style photo (scripts/fetch-photos.sh),
-// resized with INTER_CUBIC and given fine noise (sigma 1.5, fixed seed) so
-// that its count of distinct colours is that of a real camera file; the
-// count is printed as the counter "colours".
+// The photo is described in BenchPhotos.h; its count of distinct colours is
+// printed as the counter "colours".
 #include <benchmark/benchmark.h>
 #include <fcntl.h>
 #include <unistd.h>
@@ -24,66 +22,18 @@
 #include <tbb/global_control.h>
 #include <tbb/info.h>
 
+#include "BenchPhotos.h"
 #include "color/ApplyTransfer.h"
 
 namespace vora {
 namespace {
-
-constexpr int kWidth = 6000;
-constexpr int kHeight = 4000;
-
-// R, G, B bytes; empty when the sample photos have not been fetched.
-const cv::Mat& Photo24() {
-    static const cv::Mat photo = [] {
-        namespace fs = std::filesystem;
-        const fs::path styles = fs::path(VORA_SOURCE_DIR) / ".cache/photos/styles";
-        fs::path largest;
-        std::uintmax_t largestSize = 0;
-        std::error_code error;
-        for (const auto& entry : fs::directory_iterator(styles, error)) {
-            if (entry.path().extension() == ".jpg" && entry.file_size() > largestSize) {
-                largestSize = entry.file_size();
-                largest = entry.path();
-            }
-        }
-        cv::Mat result;
-        const cv::Mat bgr = largest.empty() ? cv::Mat() : cv::imread(largest.string(), cv::IMREAD_COLOR);
-        if (bgr.empty()) return result;
-        cv::Mat big, noise(kHeight, kWidth, CV_16SC3), rgb;
-        cv::resize(bgr, big, cv::Size(kWidth, kHeight), 0, 0, cv::INTER_CUBIC);
-        cv::RNG random(20261124);
-        random.fill(noise, cv::RNG::NORMAL, 0, 1.5);
-        big.convertTo(big, CV_16SC3);
-        cv::add(big, noise, big);
-        big.convertTo(big, CV_8UC3);
-        cv::cvtColor(big, result, cv::COLOR_BGR2RGB);
-        return result;
-    }();
-    return photo;
-}
-
-double DistinctColours(const cv::Mat& rgb) {
-    std::vector<bool> seen(size_t{1} << 24);
-    double count = 0;
-    for (int r = 0; r < rgb.rows; ++r) {
-        const uint8_t* p = rgb.ptr<uint8_t>(r);
-        for (int c = 0; c < rgb.cols; ++c, p += 3) {
-            const size_t key = size_t{p[0]} << 16 | size_t{p[1]} << 8 | p[2];
-            if (!seen[key]) {
-                seen[key] = true;
-                ++count;
-            }
-        }
-    }
-    return count;
-}
 
 size_t Threads(int64_t argument) {
     return argument > 0 ? static_cast<size_t>(argument) : static_cast<size_t>(tbb::info::default_concurrency());
 }
 
 void BM_MemcpyFloor(benchmark::State& state) {
-    const cv::Mat& photo = Photo24();
+    const cv::Mat& photo = bench::Photo24();
     if (photo.empty()) return state.SkipWithError("no sample photos; run scripts/fetch-photos.sh");
     std::vector<uint8_t> copy(photo.total() * 3);
     for (auto _ : state) {
@@ -96,7 +46,7 @@ BENCHMARK(BM_MemcpyFloor)->Unit(benchmark::kMillisecond)->UseRealTime();
 
 // OpenCV's own round trip; threads as OpenCV's thread count.
 void BM_OpenCvLabRoundTrip(benchmark::State& state) {
-    const cv::Mat& photo = Photo24();
+    const cv::Mat& photo = bench::Photo24();
     if (photo.empty()) return state.SkipWithError("no sample photos; run scripts/fetch-photos.sh");
     const int saved = cv::getNumThreads();
     cv::setNumThreads(static_cast<int>(Threads(state.range(0))));
@@ -139,7 +89,7 @@ TRANSFER Record(bool withFaces) {
 // Arguments: threads (0 = all that TBB offers), faces (0 or 1), kernel
 // (0 the fastest, 1 the plain per-pixel form).
 void BM_Apply(benchmark::State& state) {
-    const cv::Mat& photo = Photo24();
+    const cv::Mat& photo = bench::Photo24();
     if (photo.empty()) return state.SkipWithError("no sample photos; run scripts/fetch-photos.sh");
     const size_t threads = Threads(state.range(0));
     tbb::global_control limit(tbb::global_control::max_allowed_parallelism, threads);
@@ -148,7 +98,7 @@ void BM_Apply(benchmark::State& state) {
 
     std::vector<uint8_t> source(photo.data, photo.data + photo.total() * 3);
     std::vector<uint8_t> destination(source.size());
-    const size_t width = kWidth, height = kHeight;
+    const size_t width = photo.cols, height = photo.rows;
     const size_t layout[4] = {0, 0, 0, 0};
     auto destroy = [](IImage* image) { DestroyImageObj(image); };
     std::unique_ptr<IImage, decltype(destroy)> in(
@@ -173,7 +123,7 @@ void BM_Apply(benchmark::State& state) {
     }
     if (devNull >= 0) close(devNull);
 
-    static const double colours = DistinctColours(photo);
+    static const double colours = bench::DistinctColours(photo);
     state.counters["colours"] = colours;
     state.counters["threads"] = static_cast<double>(threads);
     state.counters["MP/s"] = benchmark::Counter(static_cast<double>(photo.total()) / 1e6 *

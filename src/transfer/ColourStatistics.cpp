@@ -1,30 +1,156 @@
 #include "transfer/ColourStatistics.h"
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <cstddef>
 #include <cstdint>
+#include <cstring>
+#include <utility>
+#include <vector>
+
+#include <tbb/blocked_range.h>
+#include <tbb/parallel_for.h>
 
 #include "color/ColorConversion.h"
 
 namespace vora {
+
+namespace {
+
+// The lightness values the conversion can give, one per labTable entry, and
+// a hash from their bits to their entry. An image converted by ConvertToLab
+// holds at most kTableSize distinct lightness values, so its sorted
+// lightness is a run of each, read from a histogram without sorting.
+class LightnessLevels {
+public:
+    LightnessLevels() {
+        m_slots.fill(kEmpty);
+        for (size_t i = 0; i < kTableSize; ++i) {
+            // The expression of RgbToLab, so the bits are the same.
+            const float value = static_cast<float>((static_cast<double>(labTable[i]) * 116.0 - 16.0) / 100.0);
+            const uint32_t bits = Bits(value);
+            size_t slot = Hash(bits);
+            while (m_slots[slot] != kEmpty && m_keys[slot] != bits) slot = (slot + 1) & (kSlots - 1);
+            if (m_slots[slot] == kEmpty) {
+                m_slots[slot] = static_cast<uint16_t>(m_values.size());
+                m_keys[slot] = bits;
+                m_values.push_back(value);
+            }
+        }
+    }
+
+    // The level of a value, or -1 when no conversion gives it.
+    int Find(float value) const {
+        const uint32_t bits = Bits(value);
+        for (size_t slot = Hash(bits);; slot = (slot + 1) & (kSlots - 1)) {
+            if (m_slots[slot] == kEmpty) return -1;
+            if (m_keys[slot] == bits) return m_slots[slot];
+        }
+    }
+    size_t Count() const { return m_values.size(); }
+    float Value(size_t level) const { return m_values[level]; }
+
+private:
+    static constexpr size_t kSlots = 8192;  // more than twice kTableSize: short probes
+    static constexpr uint16_t kEmpty = 0xFFFF;
+    static uint32_t Bits(float value) {
+        uint32_t bits;
+        std::memcpy(&bits, &value, sizeof bits);
+        return bits;
+    }
+    static size_t Hash(uint32_t bits) { return (bits * 0x9E3779B1u) >> (32 - 13); }
+
+    std::array<uint16_t, kSlots> m_slots;
+    std::array<uint32_t, kSlots> m_keys{};
+    std::vector<float> m_values;
+};
+
+const LightnessLevels& Levels() {
+    static const LightnessLevels levels;
+    return levels;
+}
+
+// Counts per level of the image's lightness; false (counts unspecified) when
+// a value is not one the conversion gives.
+bool CountLevels(const cv::Mat& lab, std::vector<int64_t>& counts) {
+    const LightnessLevels& levels = Levels();
+    counts.assign(levels.Count(), 0);
+    for (int row = 0; row < lab.rows; ++row) {
+        const float* pixel = lab.ptr<float>(row);
+        for (int c = 0; c < lab.cols; ++c, pixel += 3) {
+            const int level = levels.Find(pixel[0]);
+            if (level < 0) return false;
+            ++counts[level];
+        }
+    }
+    return true;
+}
+
+// The same statistics as the sort below, from counts: the sorted array is a
+// run of each distinct value, so every read of s[k] is the value whose run
+// holds rank k, and normalising is monotone, so it commutes with the ranks.
+void LightnessStatsFromCounts(const std::vector<int64_t>& counts, ColourStats& stats) {
+    const LightnessLevels& levels = Levels();
+    std::vector<std::pair<float, int64_t>> runs;
+    for (size_t level = 0; level < counts.size(); ++level)
+        if (counts[level] > 0) runs.emplace_back(levels.Value(level), counts[level]);
+    std::sort(runs.begin(), runs.end());
+    std::vector<int64_t> ends(runs.size());  // one past the last rank of each run
+    int64_t total = 0;
+    for (size_t i = 0; i < runs.size(); ++i) ends[i] = total += runs[i].second;
+    const auto valueAt = [&](int64_t rank) {
+        return runs[std::upper_bound(ends.begin(), ends.end(), rank) - ends.begin()].first;
+    };
+
+    const size_t n = static_cast<size_t>(total);
+    const size_t low = static_cast<size_t>(static_cast<double>(n - 1) * 0.005 + 0.5);
+    const size_t high = static_cast<size_t>(static_cast<double>(n - 1) * 0.995 + 0.5);
+    stats.lightnessLow = valueAt(static_cast<int64_t>(low));
+    stats.lightnessHigh = valueAt(static_cast<int64_t>(high));
+
+    const float pointLow = stats.lightnessLow;
+    const double spread = static_cast<double>(stats.lightnessHigh - pointLow);
+    const auto normalise = [&](float v) {
+        const double q = static_cast<double>(v - pointLow) / spread;
+        return static_cast<float>(std::min(1.0, std::max(0.0, q)));
+    };
+    int64_t zeros = 0;
+    int64_t notOnes = 0;
+    for (const auto& [value, count] : runs) {
+        const float q = normalise(value);
+        if (q == 0.0f) zeros += count;
+        if (q != 1.0f) notOnes += count;
+    }
+    const double interior = static_cast<double>(static_cast<int>(notOnes) - static_cast<int>(zeros) - 1);
+    for (int i = 0; i < 32; ++i) {
+        int64_t index = static_cast<int64_t>(static_cast<int>(zeros)) + static_cast<int>(std::ceil(i / 31.0 * interior));
+        index = std::min<int64_t>(std::max<int64_t>(index, 0), total - 1);
+        stats.lightness[i] = normalise(valueAt(index));
+    }
+}
+
+}  // namespace
 
 void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab) {
     if (bgr8.rows < 1) return;
     CV_Assert(bgr8.type() == CV_8UC3 && lab.type() == CV_32FC3 && lab.size() == bgr8.size());
 
     const int columns = bgr8.cols;
-    for (int row = 0; row < bgr8.rows; ++row) {
-        const uint8_t* in = bgr8.ptr<uint8_t>(row);
-        float* out = lab.ptr<float>(row);
-        for (int c = 0; c < columns; ++c, in += 3, out += 3) {
-            // Bytes are B, G, R; the conversion takes R, G, B.
-            const LabPixel pixel = RgbToLab(in[2], in[1], in[0]);
-            out[0] = pixel.lightness01;
-            out[1] = pixel.a;
-            out[2] = pixel.b;
+    // Each pixel on its own: rows in parallel give the same bits.
+    tbb::parallel_for(tbb::blocked_range<int>(0, bgr8.rows, 16), [&](const tbb::blocked_range<int>& rows) {
+        for (int row = rows.begin(); row < rows.end(); ++row) {
+            const uint8_t* in = bgr8.ptr<uint8_t>(row);
+            float* out = lab.ptr<float>(row);
+            for (int c = 0; c < columns; ++c, in += 3, out += 3) {
+                // Bytes are B, G, R; the conversion takes R, G, B.
+                const LabPixel pixel = RgbToLab(in[2], in[1], in[0]);
+                out[0] = pixel.lightness01;
+                out[1] = pixel.a;
+                out[2] = pixel.b;
+            }
         }
-    }
+    });
 }
 
 int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats) {
@@ -43,7 +169,19 @@ int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats) {
     return 0;
 }
 
+bool ComputeLightnessStatsFromLevels(const cv::Mat& lab, ColourStats& stats) {
+    std::vector<int64_t> counts;
+    if (lab.empty() || !CountLevels(lab, counts)) return false;
+    LightnessStatsFromCounts(counts, stats);
+    return true;
+}
+
 int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats) {
+    if (ComputeLightnessStatsFromLevels(lab, stats)) return 0;
+    return ComputeLightnessStatsBySort(lab, stats);
+}
+
+int ComputeLightnessStatsBySort(const cv::Mat& lab, ColourStats& stats) {
     const int pixels = lab.rows * lab.cols;
     const cv::Mat lightness = lab.reshape(1, pixels).col(0);
 

@@ -29,7 +29,20 @@ int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
 // A flat image (or a single pixel) normalises every value to 0, and the
 // sample index of its first entry would fall one past the end; sample indices
 // are clamped into the sorted array, so such an image samples its end values.
+//
+// Lightness as ConvertToLab gives it takes at most one value per table entry:
+// such images are summarised from a histogram of those values, without
+// sorting, with the same bits as the sort.
 int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats);
+
+// The histogram form alone: false, with stats unchanged, for an empty image
+// or one holding a lightness value no conversion gives.
+bool ComputeLightnessStatsFromLevels(const cv::Mat& lab, ColourStats& stats);
+
+// The same by sorting every value: the straightforward form, used for
+// lightness values no conversion gives, and the reference the histogram is
+// held to.
+int ComputeLightnessStatsBySort(const cv::Mat& lab, ColourStats& stats);
 
 // Symmetric square root of a 2x2 CV_32F matrix by SVD: u * diag(sqrt(w)) * vt.
 void MatrixSqrt(const cv::Mat& input, cv::Mat& output);

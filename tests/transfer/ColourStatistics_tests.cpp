@@ -2,8 +2,11 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstring>
 #include <random>
 #include <vector>
+
+#include "support/TestImages.h"
 
 #include "color/ColorConversion.h"
 #include "transfer/ColourStatistics.h"
@@ -75,6 +78,39 @@ TEST(ColourStatistics, ChromaCovarianceIsScaledByNAndSkipsLightness) {
     const cv::Mat lab = (cv::Mat_<float>(2, 6) << 0.1, 1, 2, 0.9, -1, -2, 0.4, 1, -2, 0.7, -1, 2);
     const ColourStats s = StatsOf(lab.reshape(3));
     for (int i = 0; i < 6; ++i) EXPECT_NEAR(s.data()[i], (i == 2) + 2 * (i == 5), 1e-6) << i;
+}
+
+// The histogram gives the sort's bits wherever it applies: photo-like, flat,
+// single-pixel, two-level (nothing strictly inside) and noise images, and
+// every 24-bit colour; lightness no conversion gives is left to the sort.
+TEST(ColourStatistics, LightnessFromLevelsEqualsTheSortBitForBit) {
+    cv::Mat noise(300, 401, CV_8UC3), twoLevels(20, 30, CV_8UC3, cv::Scalar::all(0));
+    cv::randu(noise, cv::Scalar::all(0), cv::Scalar::all(256));
+    twoLevels.rowRange(0, 7).setTo(cv::Scalar::all(255));
+#if defined(__SANITIZE_ADDRESS__)
+    const int allRows = 512;  // every 32nd row of the colour cube: the sort is slow under the sanitizers
+#else
+    const int allRows = 4096;
+#endif
+    cv::Mat all(allRows, 4096, CV_8UC3);
+    for (int i = 0; i < allRows * 4096; ++i) {
+        const int rgb = i * (4096 / allRows);
+        all.at<cv::Vec3b>(i / 4096, i % 4096) = cv::Vec3b(rgb >> 16, (rgb >> 8) & 255, rgb & 255);
+    }
+    const cv::Mat images[] = {testimages::SyntheticPhotoRgb(480, 640), cv::Mat(40, 30, CV_8UC3, cv::Scalar(90, 140, 30)),
+                              cv::Mat(1, 1, CV_8UC3, cv::Scalar(3, 200, 17)), twoLevels, noise, all};
+    for (const cv::Mat& bgr : images) {
+        cv::Mat lab(bgr.size(), CV_32FC3);
+        ConvertToLab(bgr, lab);
+        ColourStats fromLevels{}, bySort{};
+        ASSERT_TRUE(ComputeLightnessStatsFromLevels(lab, fromLevels)) << bgr.size();
+        ComputeLightnessStatsBySort(lab, bySort);
+        EXPECT_EQ(std::memcmp(&fromLevels, &bySort, sizeof(ColourStats)), 0) << bgr.size();
+    }
+    ColourStats unchanged{};
+    cv::Mat odd(2, 2, CV_32FC3, cv::Scalar(0.3, 0, 0));  // 0.3f is no table level
+    EXPECT_FALSE(ComputeLightnessStatsFromLevels(odd, unchanged));
+    EXPECT_FALSE(ComputeLightnessStatsFromLevels(cv::Mat(0, 0, CV_32FC3), unchanged));
 }
 
 TEST(MatrixSqrt, SquaresBackToTheRandomSymmetricPositiveInput) {
