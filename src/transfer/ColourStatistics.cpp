@@ -10,6 +10,7 @@
 #include <vector>
 
 #include <tbb/blocked_range.h>
+#include <tbb/enumerable_thread_specific.h>
 #include <tbb/parallel_for.h>
 
 #include "color/ColorConversion.h"
@@ -130,6 +131,42 @@ void LightnessStatsFromCounts(const std::vector<int64_t>& counts, ColourStats& s
     }
 }
 
+// A direct-mapped cache of the conversion, per thread: 2^bits entries of a
+// tagged 24-bit colour and its three floats (16 bytes). A photo has far
+// fewer colours than pixels.
+class LabCache {
+public:
+    explicit LabCache(unsigned bits) : m_shift(32 - bits), m_entries(size_t{1} << bits) {}
+
+    const float* Get(uint8_t red, uint8_t green, uint8_t blue) {
+        const uint32_t colour = static_cast<uint32_t>(red) << 16 | static_cast<uint32_t>(green) << 8 | blue;
+        Entry& entry = m_entries[(colour * 0x9E3779B1u) >> m_shift];
+        const uint32_t tag = colour | 0x80000000u;  // never 0, the empty entry
+        if (entry.tag != tag) {
+            const LabPixel pixel = RgbToLab(red, green, blue);
+            entry = Entry{tag, {pixel.lightness01, pixel.a, pixel.b}};
+        }
+        return entry.lab;
+    }
+
+private:
+    struct Entry {
+        uint32_t tag = 0;
+        float lab[3] = {};
+    };
+    unsigned m_shift;
+    std::vector<Entry> m_entries;
+};
+
+// Cache size by the work, as apply sizes its cache: none for small images,
+// at most 2^18 entries (4 MiB a thread).
+unsigned LabCacheBits(size_t pixels) {
+    if (pixels < (size_t{1} << 15)) return 0;
+    unsigned bits = 10;
+    while (bits < 18 && (size_t{16} << bits) < pixels) ++bits;
+    return bits;
+}
+
 }  // namespace
 
 void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab) {
@@ -137,13 +174,23 @@ void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab) {
     CV_Assert(bgr8.type() == CV_8UC3 && lab.type() == CV_32FC3 && lab.size() == bgr8.size());
 
     const int columns = bgr8.cols;
-    // Each pixel on its own: rows in parallel give the same bits.
+    const unsigned bits = LabCacheBits(static_cast<size_t>(bgr8.rows) * static_cast<size_t>(columns));
+    tbb::enumerable_thread_specific<LabCache> caches([bits] { return LabCache(bits > 0 ? bits : 1); });
+    // Each pixel on its own: rows in parallel, and a cached pixel, give the same bits.
     tbb::parallel_for(tbb::blocked_range<int>(0, bgr8.rows, 16), [&](const tbb::blocked_range<int>& rows) {
+        LabCache* cache = bits > 0 ? &caches.local() : nullptr;
         for (int row = rows.begin(); row < rows.end(); ++row) {
             const uint8_t* in = bgr8.ptr<uint8_t>(row);
             float* out = lab.ptr<float>(row);
             for (int c = 0; c < columns; ++c, in += 3, out += 3) {
                 // Bytes are B, G, R; the conversion takes R, G, B.
+                if (cache != nullptr) {
+                    const float* cached = cache->Get(in[2], in[1], in[0]);
+                    out[0] = cached[0];
+                    out[1] = cached[1];
+                    out[2] = cached[2];
+                    continue;
+                }
                 const LabPixel pixel = RgbToLab(in[2], in[1], in[0]);
                 out[0] = pixel.lightness01;
                 out[1] = pixel.a;

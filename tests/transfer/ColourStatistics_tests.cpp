@@ -41,6 +41,20 @@ TEST(ConvertToLab, EveryPixelInByteOrderThroughTheRowStride) {
     }
 }
 
+// Large enough for the per-thread colour cache, with colours that repeat and
+// collide: every pixel still has its own conversion's bits.
+TEST(ConvertToLab, CachedConversionKeepsEveryPixelsBits) {
+    cv::Mat photo = testimages::SyntheticPhotoRgb(600, 900), noise(600, 900, CV_8UC3), lab(600, 900, CV_32FC3);
+    cv::randu(noise, cv::Scalar::all(0), cv::Scalar::all(256));
+    noise.rowRange(0, 300).copyTo(photo.rowRange(300, 600));  // half random colours: many evictions
+    ConvertToLab(photo, lab);
+    for (int i = 0; i < photo.rows * photo.cols; ++i) {
+        const cv::Vec3b bgr = photo.at<cv::Vec3b>(i / photo.cols, i % photo.cols);
+        const LabPixel e = RgbToLab(bgr[2], bgr[1], bgr[0]);
+        ASSERT_EQ(std::memcmp(&lab.at<cv::Vec3f>(i / photo.cols, i % photo.cols), &e, sizeof e), 0) << i;
+    }
+}
+
 TEST(ColourStatistics, FlatImagesStayInsideTheArray) {
     // 0/0 normalises every value to 0, and the first sample index would be N.
     for (const cv::Size size : {cv::Size(1, 1), cv::Size(40, 30)}) {
