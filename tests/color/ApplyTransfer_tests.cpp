@@ -15,17 +15,9 @@
 namespace vora {
 namespace {
 
-struct ImageDeleter {
-    void operator()(IImage* image) const { DestroyImageObj(image); }
-};
-using ImagePtr = std::unique_ptr<IImage, ImageDeleter>;
+using testimages::ImagePtr;
+using testimages::Tile;
 const size_t kLayout[4] = {};
-
-// A tile of `m`: rows lie a full image width apart.
-ImagePtr Tile(cv::Mat& m, cv::Rect r) {
-    return ImagePtr(GetTileImageObj(r.height, r.width, m.channels(), kLayout, m.ptr(r.y, r.x),
-                                    CFullResImageSize(m.cols, m.rows), CTopLeftCoordinate(r.x, r.y)));
-}
 
 // The styled record differs from the identity in every term and has two overlapping faces.
 TRANSFER Record(bool styled, bool faces = true) {

@@ -17,16 +17,7 @@
 namespace vora {
 namespace {
 
-struct ImageDeleter {
-    void operator()(IImage* image) const { DestroyImageObj(image); }
-};
-using ImagePtr = std::unique_ptr<IImage, ImageDeleter>;
-const size_t kLayout[4] = {};
-
-ImagePtr Tile(cv::Mat& m, cv::Rect r) {
-    return ImagePtr(GetTileImageObj(r.height, r.width, m.channels(), kLayout, m.ptr(r.y, r.x),
-                                    CFullResImageSize(m.cols, m.rows), CTopLeftCoordinate(r.x, r.y)));
-}
+using testimages::Tile;
 
 cv::Mat Applied(const cv::Mat& source, const TRANSFER& transfer, ApplyKernel kernel, bool serial = false) {
     cv::Mat in = source.clone(), out(source.size(), source.type(), cv::Scalar::all(7));

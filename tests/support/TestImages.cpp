@@ -57,5 +57,11 @@ bool SameRecord(const TRANSFER& a, const TRANSFER& b) {
     return bytes(a) == bytes(b);
 }
 
+ImagePtr Tile(cv::Mat& m, cv::Rect r) {
+    const size_t layout[4] = {};
+    return ImagePtr(GetTileImageObj(r.height, r.width, m.channels(), layout, m.ptr(r.y, r.x),
+                                    CFullResImageSize(m.cols, m.rows), CTopLeftCoordinate(r.x, r.y)));
+}
+
 }  // namespace testimages
 }  // namespace vora

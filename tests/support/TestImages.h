@@ -2,6 +2,7 @@
 // Synthetic photographs and image-object helpers shared by the test programs.
 
 #include <cstdint>
+#include <memory>
 #include <vector>
 
 #include <opencv2/core.hpp>
@@ -24,6 +25,14 @@ struct ImageHandle {
     IImage* get() const { return image; }
     IImage* image;
 };
+
+// An owned image object: a tile `r` of `m`, its rows a full image width
+// apart, placed at r's corner of the full image.
+struct ImageDeleter {
+    void operator()(IImage* image) const { DestroyImageObj(image); }
+};
+using ImagePtr = std::unique_ptr<IImage, ImageDeleter>;
+ImagePtr Tile(cv::Mat& m, cv::Rect r);
 
 // True when every field of the two records, the face list included, is bit-identical.
 bool SameRecord(const TRANSFER& a, const TRANSFER& b);

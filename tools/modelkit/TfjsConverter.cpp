@@ -132,20 +132,20 @@ std::map<std::string, Constant> ReadWeights(const json& manifest, const fs::path
         std::string bytes;
         for (const json& path : group.at("paths")) bytes += ReadFileBytes(folder / path.get<std::string>());
         size_t offset = 0;
-        for (const json& spec : group.at("weights")) {
-            const std::string name = spec.at("name").get<std::string>();
-            const std::string dtype = spec.at("dtype").get<std::string>();
+        for (const json& entry : group.at("weights")) {
+            const std::string name = entry.at("name").get<std::string>();
+            const std::string dtype = entry.at("dtype").get<std::string>();
             Constant constant;
             size_t count = 1;
-            for (const json& dim : spec.at("shape")) {
+            for (const json& dim : entry.at("shape")) {
                 constant.shape.push_back(JsonInt(dim));
                 count *= static_cast<size_t>(constant.shape.back());
             }
             std::string stored = dtype;
             double scale = 1.0, minimum = 0.0;
-            const bool quantized = spec.contains("quantization");
+            const bool quantized = entry.contains("quantization");
             if (quantized) {
-                const json& q = spec.at("quantization");
+                const json& q = entry.at("quantization");
                 stored = q.at("dtype").get<std::string>();
                 if (q.contains("scale")) scale = q.at("scale").get<double>();
                 if (q.contains("min")) minimum = q.at("min").get<double>();

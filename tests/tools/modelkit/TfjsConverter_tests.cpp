@@ -60,9 +60,9 @@ public:
     Graph& Stored(const std::string& name, std::vector<int> shape, const std::string& dtype, const std::string& bytes,
                   const json& quantization) {
         m_nodes.push_back({{"name", name}, {"op", "Const"}});
-        json spec = {{"name", name}, {"shape", shape}, {"dtype", dtype}};
-        if (!quantization.is_null()) spec["quantization"] = quantization;
-        m_weights.push_back(spec);
+        json entry = {{"name", name}, {"shape", shape}, {"dtype", dtype}};
+        if (!quantization.is_null()) entry["quantization"] = quantization;
+        m_weights.push_back(entry);
         m_bin += bytes;
         return *this;
     }
