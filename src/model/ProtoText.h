@@ -46,8 +46,5 @@ Message Parse(const std::string& text);
 // Writes the tree back as text that Parse (and any text-format reader) accepts.
 std::string Write(const Message& message);
 
-// Appends one code point as UTF-8 (escapes here, resource names elsewhere).
-void AppendUtf8(std::string& out, uint32_t code);
-
 }  // namespace prototext
 }  // namespace vora

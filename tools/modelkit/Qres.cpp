@@ -7,7 +7,7 @@
 
 #include <zlib.h>
 
-#include "model/ProtoText.h"
+#include "model/Utf8.h"
 
 namespace vora {
 namespace modelkit {
@@ -79,7 +79,7 @@ private:
                     ++i;
                 }
             }
-            prototext::AppendUtf8(utf8, code);
+            AppendUtf8(utf8, code);
         }
         if (utf8.empty() || utf8 == "." || utf8 == ".." || utf8.find('/') != std::string::npos ||
             utf8.find('\0') != std::string::npos)
