@@ -7,46 +7,15 @@
 #include <opencv2/core.hpp>
 #include <opencv2/dnn.hpp>
 
+#include "model/InputTransform.h"
+#include "model/MeanBlob.h"
+#include "model/PreparedDefinition.h"
+
 namespace vora {
 
 extern const char* const kNetworkFolder;          // "net/"
 extern const char* const kNetworkDefinitionName;  // "deploy2.prototxt"
 extern const char* const kNetworkWeightsName;     // "caffe_reduce_512_model"
-
-// The input transform of a MemoryData first layer, which the dnn module
-// cannot run: the library applies it before the forward pass.
-struct InputTransform {
-    int channels = 3;
-    int height = 0;        // uncropped input size, from memory_data_param
-    int width = 0;
-    int cropSize = 0;      // 0: no crop
-    float scale = 1.0f;
-    std::vector<float> meanValues;  // empty, one for every channel, or one per channel
-    cv::Mat meanBlob;               // CV_32F, channels x height x width, from mean_file; empty if none
-
-    int OutputHeight() const { return cropSize > 0 ? cropSize : height; }
-    int OutputWidth() const { return cropSize > 0 ? cropSize : width; }
-};
-
-// Planar 1 x C x h x w float blob: centre crop at ((H - crop) / 2, (W - crop) / 2),
-// then (pixel - mean) x scale in float, channels in the matrix's own order.
-// The image must be 8-bit with the transform's channel count; with a crop it
-// must be at least the crop size, without one exactly height x width (when
-// those are set), and with a mean blob exactly the blob's size. Throws
-// cv::Exception otherwise.
-cv::Mat ApplyInputTransform(const InputTransform& transform, const cv::Mat& image8);
-
-// What the loader makes of a text definition before the dnn module sees it.
-struct PreparedDefinition {
-    std::string text;          // the definition as handed to the dnn module
-    bool memoryData = false;   // the first layer was a MemoryData layer, now a plain input
-    InputTransform transform;  // its transform (meanBlob not loaded here)
-    std::string meanFile;      // its mean_file as written, or empty
-    std::string inputName;     // the input blob to set; empty: the network's first input
-    std::string outputTop;     // the top no layer consumes; the first by name if several
-    std::string outputLayer;   // the dnn layer that writes it last
-    int outputIndex = 0;       // which of that layer's outputs it is
-};
 
 // Parses the definition, drops the layers a network built for testing leaves
 // out (include/exclude rules against phase TEST, level 0, no stages), replaces
@@ -56,12 +25,6 @@ struct PreparedDefinition {
 // input, a mean_value count that is neither one nor the channel count,
 // mean_file and mean_value together).
 PreparedDefinition PrepareDefinition(const std::string& definitionText);
-
-// Reads a mean blob file (the weights format's BlobProto: `shape` or the
-// num/channels/height/width fields, data as float or double) and returns its
-// first image as a channels x height x width CV_32F matrix. Throws
-// cv::Exception when the file cannot be read or does not hold that shape.
-cv::Mat ReadMeanBlob(const std::string& path, int channels, int height, int width);
 
 // The semantic feature network, run with OpenCV's dnn module on the CPU.
 class FeatureNetwork {
