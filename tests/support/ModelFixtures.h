@@ -18,7 +18,7 @@
 #include <opencv2/core.hpp>
 
 #include "model/Engine.h"
-#include "model/NetworkWriter.h"
+#include "modelkit/NetworkWriter.h"
 
 namespace vora {
 namespace fixtures {

@@ -23,7 +23,7 @@
 
 #include <opencv2/core.hpp>
 
-#include "model/NetworkWriter.h"
+#include "modelkit/NetworkWriter.h"
 
 namespace vora {
 namespace modelkit {

@@ -1,4 +1,4 @@
-#include "model/NetworkWriter.h"
+#include "modelkit/NetworkWriter.h"
 
 #include <cstring>
 #include <fstream>
