@@ -11,11 +11,13 @@
 #include "model/MeanBlob.h"
 #include "model/PreparedDefinition.h"
 
+#include "KitApi.h"
+
 namespace vora {
 
-extern const char* const kNetworkFolder;          // "net/"
-extern const char* const kNetworkDefinitionName;  // "deploy2.prototxt"
-extern const char* const kNetworkWeightsName;     // "caffe_reduce_512_model"
+extern VORA_KIT_API const char* const kNetworkFolder;          // "net/"
+extern VORA_KIT_API const char* const kNetworkDefinitionName;  // "deploy2.prototxt"
+extern VORA_KIT_API const char* const kNetworkWeightsName;     // "caffe_reduce_512_model"
 
 // Parses the definition, drops the layers a network built for testing leaves
 // out (include/exclude rules against phase TEST, level 0, no stages), replaces
@@ -27,7 +29,7 @@ extern const char* const kNetworkWeightsName;     // "caffe_reduce_512_model"
 PreparedDefinition PrepareDefinition(const std::string& definitionText);
 
 // The semantic feature network, run with OpenCV's dnn module on the CPU.
-class FeatureNetwork {
+class VORA_KIT_API FeatureNetwork {
 public:
     // Reads the text definition and binary weights. A MemoryData first layer
     // is replaced by a plain input of the transformed size; its mean_file, if

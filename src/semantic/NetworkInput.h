@@ -2,6 +2,8 @@
 
 #include <opencv2/core.hpp>
 
+#include "KitApi.h"
+
 namespace vora {
 
 class FeatureNetwork;
@@ -13,7 +15,7 @@ constexpr double kMaxAspectRatio = 1.5;
 // Aspect crop, then an area resize into a black input canvas (14 px border at
 // top and left, 15 at bottom and right for 227 in 256). Returns false, after
 // the diagnostic on standard error, when the image is empty.
-bool PrepareNetworkImage(const cv::Mat& image, cv::Mat& output, int cropSize, int inputSize);
+VORA_KIT_API bool PrepareNetworkImage(const cv::Mat& image, cv::Mat& output, int cropSize, int inputSize);
 
 // The region PrepareNetworkImage keeps of an image of the given size.
 cv::Rect AspectCropRegion(int rows, int cols);

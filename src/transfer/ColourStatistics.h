@@ -2,6 +2,8 @@
 
 #include <opencv2/core.hpp>
 
+#include "KitApi.h"
+
 namespace vora {
 
 // Summary of an image's colour, 40 floats. Database styles store entries
@@ -20,10 +22,10 @@ static_assert(sizeof(ColourStats) == 40 * sizeof(float), "ColourStats is 40 pack
 
 // bgr8: CV_8UC3 in B, G, R order; lab: CV_32FC3 of the same size, allocated by
 // the caller, receives (L*/100, a*, b*). Nothing happens for zero rows.
-void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab);
+VORA_KIT_API void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab);
 
 // Entries 0..5. The image must hold at least one pixel. Returns 0.
-int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
+VORA_KIT_API int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
 
 // Entries 6..39. The image must hold at least one pixel. Returns 0.
 // A flat image (or a single pixel) normalises every value to 0, and the
@@ -33,7 +35,7 @@ int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
 // Lightness as ConvertToLab gives it takes at most one value per table entry:
 // such images are summarised from a histogram of those values, without
 // sorting, with the same bits as the sort.
-int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats);
+VORA_KIT_API int ComputeLightnessStats(const cv::Mat& lab, ColourStats& stats);
 
 // The histogram form alone: false, with stats unchanged, for an empty image
 // or one holding a lightness value no conversion gives.
