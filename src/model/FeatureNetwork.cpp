@@ -10,10 +10,6 @@
 
 namespace vora {
 
-const char* const kNetworkFolder = "net/";
-const char* const kNetworkDefinitionName = "deploy2.prototxt";
-const char* const kNetworkWeightsName = "caffe_reduce_512_model";
-
 namespace {
 
 using prototext::Field;

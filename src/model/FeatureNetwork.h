@@ -15,9 +15,9 @@
 
 namespace vora {
 
-extern VORA_KIT_API const char* const kNetworkFolder;          // "net/"
-extern VORA_KIT_API const char* const kNetworkDefinitionName;  // "deploy2.prototxt"
-extern VORA_KIT_API const char* const kNetworkWeightsName;     // "caffe_reduce_512_model"
+constexpr const char* kNetworkFolder = "net/";
+constexpr const char* kNetworkDefinitionName = "deploy2.prototxt";
+constexpr const char* kNetworkWeightsName = "caffe_reduce_512_model";
 
 // Parses the definition, drops the layers a network built for testing leaves
 // out (include/exclude rules against phase TEST, level 0, no stages), replaces

@@ -17,11 +17,6 @@
 
 namespace vora {
 
-const char* const kClusterFileName = "semantic_cluster_1000.dat";
-const char* const kStyleFileName = "styledb_style_1500.dat";
-const char* const kScoresFileName = "semantic_style_scores_1000_1500_1.dat";
-const char* const kDistanceFileName = "styledb_fdist_1500.dat";
-
 namespace {
 
 struct FileCloser {

@@ -10,10 +10,10 @@ class Engine;
 
 enum class ReadResult { Ok = 0, CannotOpen = -4, SizeMismatch = -5 };
 
-extern VORA_KIT_API const char* const kClusterFileName;   // "semantic_cluster_1000.dat"
-extern VORA_KIT_API const char* const kStyleFileName;     // "styledb_style_1500.dat"
-extern VORA_KIT_API const char* const kScoresFileName;    // "semantic_style_scores_1000_1500_1.dat"
-extern VORA_KIT_API const char* const kDistanceFileName;  // "styledb_fdist_1500.dat"
+constexpr const char* kClusterFileName = "semantic_cluster_1000.dat";
+constexpr const char* kStyleFileName = "styledb_style_1500.dat";
+constexpr const char* kScoresFileName = "semantic_style_scores_1000_1500_1.dat";
+constexpr const char* kDistanceFileName = "styledb_fdist_1500.dat";
 
 // Data files are joined as modelDir + "/" + name (so "./model/" gives
 // "./model//name", which file systems accept).
