@@ -4,6 +4,7 @@
 #include <cstdint>
 
 #include <opencv2/core.hpp>
+#include <tbb/parallel_invoke.h>
 
 #include "color/WorkingOrder.h"
 #include "model/Engine.h"
@@ -17,22 +18,19 @@ namespace vora {
 
 namespace {
 
-// Converts an image to working Lab and summarises it. The matrix of B, G, R
-// bytes is returned too: the network reads it.
-struct AnalysedImage {
-    cv::Mat bgr8;
-    cv::Mat lab;
-    ColourStats stats{};
-};
+// The working Lab of one region of an R, G, B image, for the face samples:
+// the whole image is never converted.
+cv::Mat LabOfRegion(const cv::Mat& rgb8, const cv::Rect& region) {
+    const cv::Mat pixels = rgb8(region);
+    cv::Mat lab(pixels.rows, pixels.cols, CV_32FC3);
+    ConvertToLab(pixels, lab, ChannelOrder::Rgb);
+    return lab;
+}
 
-AnalysedImage Analyse(const IImage* image) {
-    AnalysedImage result;
-    result.bgr8 = ToWorkingOrder(image);
-    result.lab.create(result.bgr8.rows, result.bgr8.cols, CV_32FC3);
-    ConvertToLab(result.bgr8, result.lab);
-    ComputeChromaStats(result.lab, result.stats);
-    ComputeLightnessStats(result.lab, result.stats);
-    return result;
+ColourStats Summarise(const IImage* image) {
+    ColourStats stats{};
+    SummariseColours(RgbView(image), ChannelOrder::Rgb, stats);
+    return stats;
 }
 
 }  // namespace
@@ -43,12 +41,15 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
     if (params.numTransfers == 0) return STATUS_NO_TRANSFERS_REQUESTED;
     if (!engine->CanRankStyles()) return STATUS_MODEL_INCOMPLETE;
 
-    const AnalysedImage analysed = Analyse(content);
-
+    // The statistics and the network read the caller's pixels as they stand,
+    // side by side: neither keeps a copy of the image.
+    const cv::Mat rgb8 = RgbView(content);
+    ColourStats stats{};
     std::array<float, 512> feature{};
-    // A second header over the same pixels: the network input is prepared from it.
-    const cv::Mat shared = analysed.bgr8;
-    if (!ExtractFeature(*engine->network, shared, feature.data())) return STATUS_MODEL_INCOMPLETE;
+    bool extracted = false;
+    tbb::parallel_invoke([&] { SummariseColours(rgb8, ChannelOrder::Rgb, stats); },
+                         [&] { extracted = ExtractFeature(*engine->network, rgb8, feature.data(), ChannelOrder::Rgb); });
+    if (!extracted) return STATUS_MODEL_INCOMPLETE;
 
     std::vector<int32_t> clusterOrder(engine->clusterCentres.size(), 0);
     OrderClusters(*engine, feature.data(), clusterOrder);
@@ -56,15 +57,16 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
     std::vector<int32_t> chosenClusters;
     std::vector<int32_t> chosenStyles;
     const Status selected =
-        SelectStyles(*engine, analysed.stats, clusterOrder, chosenClusters, chosenStyles, params);
+        SelectStyles(*engine, stats, clusterOrder, chosenClusters, chosenStyles, params);
     if (selected != STATUS_OK) return selected;
 
     for (uint32_t i = 0; i < params.numTransfers; ++i) {
         TRANSFER& record = out[i];
         record.clusterIndex = chosenClusters[i];
         record.styleIndex = chosenStyles[i];
-        SolveTransfer(analysed.stats, engine->styleRecords[chosenStyles[i]], record, params);
-        FinishTransfer(analysed.lab, params, record);
+        SolveTransfer(stats, engine->styleRecords[chosenStyles[i]], record, params);
+        FinishTransfer(
+            rgb8.size(), [&rgb8](const cv::Rect& region) { return LabOfRegion(rgb8, region); }, params, record);
     }
     return STATUS_OK;
 }
@@ -91,20 +93,11 @@ Status ComputeTransfersArray(const Engine* engine, const IImage* content, TRANSF
 Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, TRANSFER& out,
                                    const VoraParameters& params) {
     if (!content || !style) return STATUS_INVALID_ARGUMENT;
-    const cv::Mat contentBgr = ToWorkingOrder(content);
-    const cv::Mat styleBgr = ToWorkingOrder(style);
-
-    cv::Mat contentLab(contentBgr.rows, contentBgr.cols, CV_32FC3);
-    ConvertToLab(contentBgr, contentLab);
-    cv::Mat styleLab(styleBgr.rows, styleBgr.cols, CV_32FC3);
-    ConvertToLab(styleBgr, styleLab);
-
+    // Each summary sums in image order on one thread; side by side, the two
+    // keep both cores busy.
     ColourStats contentStats{};
-    ComputeChromaStats(contentLab, contentStats);
-    ComputeLightnessStats(contentLab, contentStats);
     ColourStats styleStats{};
-    ComputeChromaStats(styleLab, styleStats);
-    ComputeLightnessStats(styleLab, styleStats);
+    tbb::parallel_invoke([&] { contentStats = Summarise(content); }, [&] { styleStats = Summarise(style); });
 
     out.clusterIndex = -1;
     out.styleIndex = -1;
@@ -118,10 +111,10 @@ Status ComputeTransferToStyleIndex(const Engine* engine, const IImage* content, 
     if (styleIndex < 0 || static_cast<size_t>(styleIndex) >= engine->styleRecords.size())
         return STATUS_STYLE_INDEX_OUT_OF_RANGE;
 
-    const AnalysedImage analysed = Analyse(content);
+    const ColourStats stats = Summarise(content);
     out.clusterIndex = -1;
     out.styleIndex = styleIndex;
-    SolveTransfer(analysed.stats, engine->styleRecords[styleIndex], out, params);
+    SolveTransfer(stats, engine->styleRecords[styleIndex], out, params);
     return STATUS_OK;
 }
 

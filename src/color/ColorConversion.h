@@ -33,7 +33,9 @@ struct LabPixel {
     float b;
 };
 
-inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue) {
+// lightnessEntry receives the labTable entry the lightness comes from: an
+// image's lightness takes at most one value per entry.
+inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue, std::size_t& lightnessEntry) {
     // Pure 2.2 power law, no linear toe.
     const double r = gammaTable[TableIndex(static_cast<float>(red) / 255.0f)];
     const double g = gammaTable[TableIndex(static_cast<float>(green) / 255.0f)];
@@ -46,14 +48,21 @@ inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue) {
     z = z * kInvWhiteZ;
 
     const float fx = labTable[TableIndex(x)];
-    const float fy = labTable[TableIndex(y)];
+    const std::size_t entryY = TableIndex(y);
+    const float fy = labTable[entryY];
     const float fz = labTable[TableIndex(z)];
 
     LabPixel lab;
     lab.lightness01 = static_cast<float>((static_cast<double>(fy) * 116.0 - 16.0) / 100.0);
     lab.a = static_cast<float>(static_cast<double>(fx - fy) * 500.0);
     lab.b = static_cast<float>(static_cast<double>(fy - fz) * 200.0);
+    lightnessEntry = entryY;
     return lab;
+}
+
+inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue) {
+    std::size_t lightnessEntry;
+    return RgbToLab(red, green, blue, lightnessEntry);
 }
 
 inline float LabExpand(float f) {

@@ -12,4 +12,11 @@ namespace vora {
 // exception.
 cv::Mat ToWorkingOrder(const IImage* image);
 
+// The same pixels as they stand (R, G, B), without a copy: a header over the
+// image's own bytes, which the caller must keep alive and not modify meanwhile.
+cv::Mat RgbView(const IImage* image);
+
+// Byte order of 8-bit colour pixels handed to the colour statistics.
+enum class ChannelOrder { Rgb, Bgr };
+
 }  // namespace vora

@@ -53,9 +53,10 @@ bool PrepareNetworkImage(const cv::Mat& image, cv::Mat& output, int cropSize, in
     return true;
 }
 
-bool ExtractFeature(FeatureNetwork& network, const cv::Mat& bgr8, float* feature) {
+bool ExtractFeature(FeatureNetwork& network, const cv::Mat& pixels8, float* feature, ChannelOrder order) {
     cv::Mat input;
-    if (!PrepareNetworkImage(bgr8, input, kNetworkImageSize, kNetworkInputSize)) return false;
+    if (!PrepareNetworkImage(pixels8, input, kNetworkImageSize, kNetworkInputSize)) return false;
+    if (order == ChannelOrder::Rgb) cv::cvtColor(input, input, cv::COLOR_RGB2BGR);
     const std::vector<float> output = network.Forward(input);
     // A network with a shorter output cannot give a feature; nothing is written.
     if (output.size() < static_cast<size_t>(kFeatureLength)) return false;

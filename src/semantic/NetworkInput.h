@@ -3,6 +3,7 @@
 #include <opencv2/core.hpp>
 
 #include "KitApi.h"
+#include "color/WorkingOrder.h"
 
 namespace vora {
 
@@ -22,6 +23,9 @@ cv::Rect AspectCropRegion(int rows, int cols);
 
 // Runs the network once and copies the first 512 output floats into feature.
 // Returns false when the image is empty (the feature is left as it was).
-bool ExtractFeature(FeatureNetwork& network, const cv::Mat& bgr8, float* feature);
+// The network takes B, G, R; an R, G, B image is resized as it stands and
+// only the small input is reordered (the resize treats channels alike).
+bool ExtractFeature(FeatureNetwork& network, const cv::Mat& pixels8, float* feature,
+                    ChannelOrder order = ChannelOrder::Bgr);
 
 }  // namespace vora

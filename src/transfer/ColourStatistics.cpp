@@ -6,14 +6,24 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
+#include <cstdlib>
+#include <memory>
+#include <new>
 #include <utility>
 #include <vector>
+
+#if defined(__linux__)
+#include <sys/mman.h>
+#endif
 
 #include <tbb/blocked_range.h>
 #include <tbb/enumerable_thread_specific.h>
 #include <tbb/parallel_for.h>
+#include <tbb/parallel_pipeline.h>
+#include <tbb/task_arena.h>
 
 #include "color/ColorConversion.h"
+#include "color/LabByTables.h"
 
 namespace vora {
 
@@ -25,7 +35,7 @@ namespace {
 // lightness is a run of each, read from a histogram without sorting.
 class LightnessLevels {
 public:
-    LightnessLevels() {
+    LightnessLevels() : m_levelOfEntry(kTableSize) {
         m_slots.fill(kEmpty);
         for (size_t i = 0; i < kTableSize; ++i) {
             // The expression of RgbToLab, so the bits are the same.
@@ -38,6 +48,7 @@ public:
                 m_keys[slot] = bits;
                 m_values.push_back(value);
             }
+            m_levelOfEntry[i] = m_slots[slot];
         }
     }
 
@@ -50,6 +61,8 @@ public:
         }
     }
     size_t Count() const { return m_values.size(); }
+    // The level of the value labTable[entry] gives.
+    size_t LevelOfEntry(size_t entry) const { return m_levelOfEntry[entry]; }
     float Value(size_t level) const { return m_values[level]; }
 
 private:
@@ -65,6 +78,7 @@ private:
     std::array<uint16_t, kSlots> m_slots;
     std::array<uint32_t, kSlots> m_keys{};
     std::vector<float> m_values;
+    std::vector<uint16_t> m_levelOfEntry;
 };
 
 const LightnessLevels& Levels() {
@@ -131,73 +145,189 @@ void LightnessStatsFromCounts(const std::vector<int64_t>& counts, ColourStats& s
     }
 }
 
-// A direct-mapped cache of the conversion, per thread: 2^bits entries of a
-// tagged 24-bit colour and its three floats (16 bytes). A photo has far
-// fewer colours than pixels.
-class LabCache {
-public:
-    explicit LabCache(unsigned bits) : m_shift(32 - bits), m_entries(size_t{1} << bits) {}
+// Row bands of about this many pixels flow through the summary's first pass.
+constexpr size_t kBandPixels = size_t{1} << 16;
 
-    const float* Get(uint8_t red, uint8_t green, uint8_t blue) {
-        const uint32_t colour = static_cast<uint32_t>(red) << 16 | static_cast<uint32_t>(green) << 8 | blue;
-        Entry& entry = m_entries[(colour * 0x9E3779B1u) >> m_shift];
-        const uint32_t tag = colour | 0x80000000u;  // never 0, the empty entry
-        if (entry.tag != tag) {
-            const LabPixel pixel = RgbToLab(red, green, blue);
-            entry = Entry{tag, {pixel.lightness01, pixel.a, pixel.b}};
-        }
-        return entry.lab;
+// The summary's first pass: bands of rows are converted on any thread into
+// the image's chroma pairs (a*, b*), and counted by lightness table entry;
+// each band is then handed, in image order, to one consumer, which forms the
+// sequential sums OpenCV forms (their bits are the statistics' bits) while
+// later bands are still being converted.
+template <class Consume>
+void ConvertInBands(const cv::Mat& pixels8, ChannelOrder order, float* pairs, std::vector<int64_t>& entryCounts,
+                    Consume&& consume) {
+    const int columns = pixels8.cols;
+    const int bandRows = static_cast<int>(std::max<size_t>(1, kBandPixels / static_cast<size_t>(columns)));
+    const int bands = (pixels8.rows + bandRows - 1) / bandRows;
+    const LabByTables& convert = LabByTables::Get();
+    tbb::enumerable_thread_specific<std::vector<int64_t>> threadCounts(std::vector<int64_t>(kTableSize, 0));
+    const int redOffset = order == ChannelOrder::Rgb ? 0 : 2;
+    const int blueOffset = 2 - redOffset;
+    const size_t bandPixels = static_cast<size_t>(bandRows) * static_cast<size_t>(columns);
+    const size_t total = pixels8.total();
+
+    int next = 0;
+    tbb::parallel_pipeline(
+        static_cast<size_t>(2 * tbb::this_task_arena::max_concurrency()),
+        tbb::make_filter<void, int>(tbb::filter_mode::serial_in_order,
+                                    [&](tbb::flow_control& control) {
+                                        if (next == bands) control.stop();
+                                        return next++;
+                                    }) &
+            tbb::make_filter<int, int>(
+                tbb::filter_mode::parallel,
+                [&](int band) {
+                    std::vector<int64_t>& counts = threadCounts.local();
+                    float* out = pairs + 2 * bandPixels * static_cast<size_t>(band);
+                    const int last = std::min(pixels8.rows, (band + 1) * bandRows);
+                    for (int row = band * bandRows; row < last; ++row) {
+                        const uint8_t* in = pixels8.ptr<uint8_t>(row);
+                        for (int c = 0; c < columns; ++c, in += 3, out += 2) {
+                            size_t entry;
+                            const LabPixel lab = convert(in[redOffset], in[1], in[blueOffset], entry);
+                            ++counts[entry];
+                            out[0] = lab.a;
+                            out[1] = lab.b;
+                        }
+                    }
+                    return band;
+                }) &
+            tbb::make_filter<int, void>(tbb::filter_mode::serial_in_order, [&](int band) {
+                const size_t first = bandPixels * static_cast<size_t>(band);
+                const size_t count = std::min(bandPixels, total - first);
+                consume(static_cast<const float*>(pairs + 2 * first), count);
+            }));
+
+    entryCounts.assign(kTableSize, 0);
+    for (const std::vector<int64_t>& counts : threadCounts)
+        for (size_t entry = 0; entry < kTableSize; ++entry) entryCounts[entry] += counts[entry];
+}
+
+// Uninitialised floats for the pairs. Large buffers ask for huge pages:
+// faulting in 4 KiB pages one by one costs a third of a 24-megapixel summary.
+class PairBuffer {
+public:
+    explicit PairBuffer(size_t floats) {
+        const size_t bytes = (floats * sizeof(float) + kHugePage - 1) / kHugePage * kHugePage;
+        m_data = static_cast<float*>(std::aligned_alloc(kHugePage, bytes));
+        if (m_data == nullptr) throw std::bad_alloc();
+#ifdef MADV_HUGEPAGE
+        if (bytes >= 4 * kHugePage) madvise(m_data, bytes, MADV_HUGEPAGE);  // advice only: failure is harmless
+#endif
     }
+    ~PairBuffer() { std::free(m_data); }
+    PairBuffer(const PairBuffer&) = delete;
+    PairBuffer& operator=(const PairBuffer&) = delete;
+    float* get() const { return m_data; }
 
 private:
-    struct Entry {
-        uint32_t tag = 0;
-        float lab[3] = {};
-    };
-    unsigned m_shift;
-    std::vector<Entry> m_entries;
+    static constexpr size_t kHugePage = size_t{2} << 20;
+    float* m_data;
 };
 
-// Cache size by the work, as apply sizes its cache: none for small images,
-// at most 2^18 entries (4 MiB a thread).
-unsigned LabCacheBits(size_t pixels) {
-    if (pixels < (size_t{1} << 15)) return 0;
-    unsigned bits = 10;
-    while (bits < 18 && (size_t{16} << bits) < pixels) ++bits;
-    return bits;
+// Adds the pairs to the two float sums in order. Out of line for the reason
+// given below.
+[[gnu::noinline]] void AddPairs(const float* pairs, size_t count, float& sumA, float& sumB) {
+    float a = sumA, b = sumB;
+    for (const float* const end = pairs + 2 * count; pairs != end; pairs += 2) {
+        a = a + pairs[0];
+        b = b + pairs[1];
+    }
+    sumA = a;
+    sumB = b;
+}
+
+struct CentredProducts {
+    double aa, ab, bb;
+};
+
+// Kept out of line: inlined into its caller, GCC keeps the three sums in
+// memory, which adds a store and a load to each addition this loop waits on.
+[[gnu::noinline]] CentredProducts SumCentredProducts(const float* pairs, size_t count, float meanA, float meanB) {
+    double aa = 0.0, ab = 0.0, bb = 0.0;
+    for (const float* const end = pairs + 2 * count; pairs != end; pairs += 2) {
+        const double a = pairs[0] - meanA;
+        const double b = pairs[1] - meanB;
+        aa += a * a;
+        ab += a * b;
+        bb += b * b;
+    }
+    return {aa, ab, bb};
 }
 
 }  // namespace
 
-void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab) {
-    if (bgr8.rows < 1) return;
-    CV_Assert(bgr8.type() == CV_8UC3 && lab.type() == CV_32FC3 && lab.size() == bgr8.size());
+void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrder order) {
+    if (pixels8.rows < 1) return;
+    CV_Assert(pixels8.type() == CV_8UC3 && lab.type() == CV_32FC3 && lab.size() == pixels8.size());
 
-    const int columns = bgr8.cols;
-    const unsigned bits = LabCacheBits(static_cast<size_t>(bgr8.rows) * static_cast<size_t>(columns));
-    tbb::enumerable_thread_specific<LabCache> caches([bits] { return LabCache(bits > 0 ? bits : 1); });
-    // Each pixel on its own: rows in parallel, and a cached pixel, give the same bits.
-    tbb::parallel_for(tbb::blocked_range<int>(0, bgr8.rows, 16), [&](const tbb::blocked_range<int>& rows) {
-        LabCache* cache = bits > 0 ? &caches.local() : nullptr;
+    const LabByTables& convert = LabByTables::Get();
+    const int columns = pixels8.cols;
+    const int redOffset = order == ChannelOrder::Rgb ? 0 : 2;
+    const int blueOffset = 2 - redOffset;
+    // Each pixel on its own, so rows in parallel give the same bits.
+    tbb::parallel_for(tbb::blocked_range<int>(0, pixels8.rows, 16), [&](const tbb::blocked_range<int>& rows) {
         for (int row = rows.begin(); row < rows.end(); ++row) {
-            const uint8_t* in = bgr8.ptr<uint8_t>(row);
+            const uint8_t* in = pixels8.ptr<uint8_t>(row);
             float* out = lab.ptr<float>(row);
             for (int c = 0; c < columns; ++c, in += 3, out += 3) {
-                // Bytes are B, G, R; the conversion takes R, G, B.
-                if (cache != nullptr) {
-                    const float* cached = cache->Get(in[2], in[1], in[0]);
-                    out[0] = cached[0];
-                    out[1] = cached[1];
-                    out[2] = cached[2];
-                    continue;
-                }
-                const LabPixel pixel = RgbToLab(in[2], in[1], in[0]);
+                size_t entry;
+                const LabPixel pixel = convert(in[redOffset], in[1], in[blueOffset], entry);
                 out[0] = pixel.lightness01;
                 out[1] = pixel.a;
                 out[2] = pixel.b;
             }
         }
     });
+}
+
+void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats) {
+    CV_Assert(pixels8.type() == CV_8UC3 && !pixels8.empty());
+    const int pixels = pixels8.rows * pixels8.cols;
+    // Every pixel's (a*, b*), kept for the second pass: 8 bytes a pixel.
+    const PairBuffer pairs(2 * pixels8.total());
+
+    // Pass 1: the chroma sums in image order, in float, from the first pixel
+    // on, as OpenCV's row reduction forms them.
+    float sumA = 0.0f, sumB = 0.0f;
+    bool first = true;
+    std::vector<int64_t> entryCounts;
+    ConvertInBands(pixels8, order, pairs.get(), entryCounts, [&](const float* band, size_t count) {
+        if (first) {
+            sumA = band[0];
+            sumB = band[1];
+            first = false;
+            AddPairs(band + 2, count - 1, sumA, sumB);
+        } else {
+            AddPairs(band, count, sumA, sumB);
+        }
+    });
+    // The average: the float sum times the float of 1/n, plus a zero offset.
+    const float scale = static_cast<float>(1.0 / pixels);
+    const float meanA = sumA * scale + 0.0f;
+    const float meanB = sumB * scale + 0.0f;
+
+    // Pass 2: the products of the centred values (float differences, exact
+    // products in double) summed in image order, as OpenCV's transposed
+    // product forms each entry of the upper triangle.
+    const CentredProducts sums = SumCentredProducts(pairs.get(), pixels8.total(), meanA, meanB);
+    const double sumAA = sums.aa, sumAB = sums.ab, sumBB = sums.bb;
+    const double sampleScale = 1.0 / pixels;
+    cv::Mat covariance(2, 2, CV_32F);
+    covariance.at<float>(0, 0) = static_cast<float>(sumAA * sampleScale);
+    covariance.at<float>(0, 1) = covariance.at<float>(1, 0) = static_cast<float>(sumAB * sampleScale);
+    covariance.at<float>(1, 1) = static_cast<float>(sumBB * sampleScale);
+
+    stats.chromaMean[0] = meanA;
+    stats.chromaMean[1] = meanB;
+    cv::Mat root;
+    MatrixSqrt(covariance, root);
+    for (int i = 0; i < 4; ++i) stats.chromaSqrtCov[i] = root.at<float>(i / 2, i % 2);
+
+    const LightnessLevels& levels = Levels();
+    std::vector<int64_t> counts(levels.Count(), 0);
+    for (size_t entry = 0; entry < kTableSize; ++entry) counts[levels.LevelOfEntry(entry)] += entryCounts[entry];
+    LightnessStatsFromCounts(counts, stats);
 }
 
 int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats) {

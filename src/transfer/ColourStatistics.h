@@ -3,6 +3,7 @@
 #include <opencv2/core.hpp>
 
 #include "KitApi.h"
+#include "color/WorkingOrder.h"
 
 namespace vora {
 
@@ -20,9 +21,19 @@ struct ColourStats {
 };
 static_assert(sizeof(ColourStats) == 40 * sizeof(float), "ColourStats is 40 packed floats");
 
-// bgr8: CV_8UC3 in B, G, R order; lab: CV_32FC3 of the same size, allocated by
-// the caller, receives (L*/100, a*, b*). Nothing happens for zero rows.
-VORA_KIT_API void ConvertToLab(const cv::Mat& bgr8, cv::Mat& lab);
+// pixels8: CV_8UC3 in B, G, R order (or as `order` says); lab: CV_32FC3 of the
+// same size, allocated by the caller, receives (L*/100, a*, b*). Nothing
+// happens for zero rows.
+VORA_KIT_API void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrder order = ChannelOrder::Bgr);
+
+// All 40 entries, straight from 8-bit pixels (CV_8UC3, in the given order):
+// the same bits as ConvertToLab followed by ComputeChromaStats and
+// ComputeLightnessStats, without the float Lab image. Bands of rows are
+// converted on all threads and summed in image order on one. Memory besides
+// the image: the chroma of every pixel (8 bytes a pixel, freed on return)
+// and lightness counts per thread (24 KiB). The image must hold at least one
+// pixel.
+VORA_KIT_API void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats);
 
 // Entries 0..5. The image must hold at least one pixel. Returns 0.
 VORA_KIT_API int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);

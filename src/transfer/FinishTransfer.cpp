@@ -52,6 +52,11 @@ void ApplyTransferToLab(const cv::Mat& sample, const TRANSFER& transfer, cv::Mat
 }
 
 int FinishTransfer(const cv::Mat& lab, const VoraParameters& params, TRANSFER& transfer) {
+    return FinishTransfer(lab.size(), [&lab](const cv::Rect& region) { return lab(region); }, params, transfer);
+}
+
+int FinishTransfer(cv::Size size, const std::function<cv::Mat(const cv::Rect&)>& labOf,
+                   const VoraParameters& params, TRANSFER& transfer) {
     const float target = params.finishFactor * 0.5f;
     const int32_t count = static_cast<int32_t>(params.numFaceRects);
     // A null array with a non-zero count is read as no faces, never dereferenced.
@@ -70,10 +75,10 @@ int FinishTransfer(const cv::Mat& lab, const VoraParameters& params, TRANSFER& t
         const double halfX = (face.right - face.left) * 0.28;
         const double halfY = (face.bottom - face.top) * 0.28;
 
-        const int x1 = TruncateBound((centreX + halfX) * lab.cols);
-        const int x2 = TruncateBound((centreX - halfX) * lab.cols);
-        const int y1 = TruncateBound((centreY + halfY) * lab.rows);
-        const int y2 = TruncateBound((centreY - halfY) * lab.rows);
+        const int x1 = TruncateBound((centreX + halfX) * size.width);
+        const int x2 = TruncateBound((centreX - halfX) * size.width);
+        const int y1 = TruncateBound((centreY + halfY) * size.height);
+        const int y2 = TruncateBound((centreY - halfY) * size.height);
         const int width = std::max(x1, x2) - std::min(x1, x2);
         const int height = std::max(y1, y2) - std::min(y1, y2);
         // Sampled when either side reaches 10 pixels. An empty sample (one
@@ -82,7 +87,7 @@ int FinishTransfer(const cv::Mat& lab, const VoraParameters& params, TRANSFER& t
         if (width == 0 || height == 0) continue;
 
         // No clipping: a rectangle outside the image throws OpenCV's exception.
-        const cv::Mat sample = lab(cv::Rect(std::min(x1, x2), std::min(y1, y2), width, height));
+        const cv::Mat sample = labOf(cv::Rect(std::min(x1, x2), std::min(y1, y2), width, height));
         cv::Mat transferred;
         ApplyTransferToLab(sample, transfer, transferred);
 

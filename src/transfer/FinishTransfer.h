@@ -1,5 +1,7 @@
 #pragma once
 
+#include <functional>
+
 #include <opencv2/core.hpp>
 
 #include <vora/vora.h>
@@ -12,6 +14,12 @@ namespace vora {
 // A null face array is read as no faces whatever the count, and a sample
 // with one side of 0 pixels (nothing to take a median of) is skipped.
 int FinishTransfer(const cv::Mat& lab, const VoraParameters& params, TRANSFER& transfer);
+
+// The same over an image of `size` whose working Lab is produced only where a
+// face is sampled: labOf(region) returns the CV_32FC3 Lab of that region, and
+// throws as a sub-matrix does for a region outside the image.
+int FinishTransfer(cv::Size size, const std::function<cv::Mat(const cv::Rect&)>& labOf,
+                   const VoraParameters& params, TRANSFER& transfer);
 
 // The per-pixel transfer without the face lift, in matrix form. sample is
 // CV_32FC3 working Lab (may be a view); result receives a new matrix.

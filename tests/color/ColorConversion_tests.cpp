@@ -3,9 +3,11 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <cstring>
 #include <limits>
 
 #include "color/ColorConversion.h"
+#include "color/LabByTables.h"
 #include "color/ColorTables.h"
 
 namespace vora {
@@ -28,6 +30,18 @@ TEST(ColorConversion, WhiteBlackAndBeyond) {
     const float nan = std::numeric_limits<float>::quiet_NaN();
     EXPECT_EQ(LevelDistance(255, 255, 255, {2.0f, 0.0f, 0.0f}) + LevelDistance(0, 0, 0, {nan, nan, nan}), 0);
     EXPECT_EQ(LabToRgb(0.5f, 300.0f, 0.0f).green, 0);  // far below 0
+}
+
+// The table form gives the reference conversion's bits for every 24-bit
+// colour, lightness entry included.
+TEST(ColorConversion, TableFormEqualsTheReferenceForEveryColour) {
+    const LabByTables& tables = LabByTables::Get();
+    for (uint32_t rgb = 0; rgb < (1u << 24); ++rgb) {
+        size_t expectedEntry = 0, entry = 1;
+        const LabPixel expected = RgbToLab(rgb >> 16, (rgb >> 8) & 255, rgb & 255, expectedEntry);
+        const LabPixel lab = tables(rgb >> 16, (rgb >> 8) & 255, rgb & 255, entry);
+        ASSERT_TRUE(std::memcmp(&lab, &expected, sizeof lab) == 0 && entry == expectedEntry) << std::hex << rgb;
+    }
 }
 
 // Primaries: bytes are R, G, B both ways (the zero channels come back near black,

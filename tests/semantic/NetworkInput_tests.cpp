@@ -28,6 +28,22 @@ TEST(NetworkInput, AreaResizedCropOnABlackCanvas) {
     EXPECT_EQ(cv::norm(input, canvas, cv::NORM_INF), 0.0);
 }
 
+// Compute prepares the input from the caller's R, G, B bytes and reorders only
+// the small result; the area resize must treat the channels alike for that to
+// give the bytes of preparing a B, G, R copy. Shrinks by fractional and whole
+// factors, and an enlargement.
+TEST(NetworkInput, ReorderingAfterTheResizeGivesTheSameInput) {
+    for (const cv::Size size : {cv::Size(6000, 4000), cv::Size(1135, 1362), cv::Size(454, 454), cv::Size(150, 101)}) {
+        cv::Mat bgr(size, CV_8UC3), rgb, fromBgr, fromRgb;
+        cv::randu(bgr, cv::Scalar::all(0), cv::Scalar::all(256));
+        cv::cvtColor(bgr, rgb, cv::COLOR_BGR2RGB);
+        ASSERT_TRUE(PrepareNetworkImage(bgr, fromBgr, kNetworkImageSize, kNetworkInputSize));
+        ASSERT_TRUE(PrepareNetworkImage(rgb, fromRgb, kNetworkImageSize, kNetworkInputSize));
+        cv::cvtColor(fromRgb, fromRgb, cv::COLOR_RGB2BGR);
+        EXPECT_EQ(cv::norm(fromBgr, fromRgb, cv::NORM_INF), 0.0) << size;
+    }
+}
+
 TEST(NetworkInput, EmptyImageIsReportedOnStandardError) {
     cv::Mat input(3, 3, CV_8UC3, cv::Scalar::all(7));
     testing::internal::CaptureStderr();

@@ -3,8 +3,13 @@
 #include <algorithm>
 #include <cmath>
 #include <cstring>
+#include <filesystem>
+#include <string>
 #include <random>
 #include <vector>
+
+#include <opencv2/imgcodecs.hpp>
+#include <opencv2/imgproc.hpp>
 
 #include "support/TestImages.h"
 
@@ -38,20 +43,6 @@ TEST(ConvertToLab, EveryPixelInByteOrderThroughTheRowStride) {
         const cv::Vec3b bgr = view.at<cv::Vec3b>(i / 5, i % 5);
         const LabPixel e = RgbToLab(bgr[2], bgr[1], bgr[0]);
         ASSERT_EQ(lab.at<cv::Vec3f>(i / 5, i % 5), cv::Vec3f(e.lightness01, e.a, e.b)) << i;
-    }
-}
-
-// Large enough for the per-thread colour cache, with colours that repeat and
-// collide: every pixel still has its own conversion's bits.
-TEST(ConvertToLab, CachedConversionKeepsEveryPixelsBits) {
-    cv::Mat photo = testimages::SyntheticPhotoRgb(600, 900), noise(600, 900, CV_8UC3), lab(600, 900, CV_32FC3);
-    cv::randu(noise, cv::Scalar::all(0), cv::Scalar::all(256));
-    noise.rowRange(0, 300).copyTo(photo.rowRange(300, 600));  // half random colours: many evictions
-    ConvertToLab(photo, lab);
-    for (int i = 0; i < photo.rows * photo.cols; ++i) {
-        const cv::Vec3b bgr = photo.at<cv::Vec3b>(i / photo.cols, i % photo.cols);
-        const LabPixel e = RgbToLab(bgr[2], bgr[1], bgr[0]);
-        ASSERT_EQ(std::memcmp(&lab.at<cv::Vec3f>(i / photo.cols, i % photo.cols), &e, sizeof e), 0) << i;
     }
 }
 
@@ -125,6 +116,40 @@ TEST(ColourStatistics, LightnessFromLevelsEqualsTheSortBitForBit) {
     cv::Mat odd(2, 2, CV_32FC3, cv::Scalar(0.3, 0, 0));  // 0.3f is no table level
     EXPECT_FALSE(ComputeLightnessStatsFromLevels(odd, unchanged));
     EXPECT_FALSE(ComputeLightnessStatsFromLevels(cv::Mat(0, 0, CV_32FC3), unchanged));
+}
+
+// The fused summary of 8-bit pixels holds the bits of the Lab image's
+// statistics (OpenCV's float and double sums included): photo-like and noise
+// images over many bands, a row longer than a band, a column of two bands,
+// strided views, flat and single pixels, in both byte orders, and the sample
+// photographs at full size when they are in the cache.
+TEST(ColourStatistics, SummaryOfPixelsEqualsTheLabImageStatisticsBitForBit) {
+    cv::Mat noise(700, 1100, CV_8UC3), wide(3, 70001, CV_8UC3), tall(70001, 1, CV_8UC3);
+    cv::randu(noise, cv::Scalar::all(0), cv::Scalar::all(256));
+    cv::randu(wide, cv::Scalar::all(0), cv::Scalar::all(256));
+    cv::randu(tall, cv::Scalar::all(0), cv::Scalar::all(256));
+    const cv::Mat photo = testimages::SyntheticPhotoRgb(1200, 1700);
+    std::vector<cv::Mat> images = {photo, noise, wide, tall, photo(cv::Rect(13, 7, 999, 1001)),
+                                   cv::Mat(40, 30, CV_8UC3, cv::Scalar(90, 140, 30)),
+                                   cv::Mat(1, 1, CV_8UC3, cv::Scalar(3, 200, 17)),
+                                   cv::Mat(5, 3, CV_8UC3, cv::Scalar::all(128))};
+    namespace fs = std::filesystem;
+    const fs::path content = fs::path(VORA_SOURCE_DIR) / ".cache/photos/content";
+    for (const char* name : {"astronaut.png", "grace_hopper.jpg"})
+        if (fs::exists(content / name)) images.push_back(cv::imread((content / name).string(), cv::IMREAD_COLOR));
+
+    for (const cv::Mat& bgr : images) {
+        ASSERT_FALSE(bgr.empty());
+        cv::Mat lab(bgr.size(), CV_32FC3), rgb;
+        ConvertToLab(bgr, lab);
+        const ColourStats expected = StatsOf(lab);
+        cv::cvtColor(bgr, rgb, cv::COLOR_BGR2RGB);
+        ColourStats fromBgr{}, fromRgb{};
+        SummariseColours(bgr, ChannelOrder::Bgr, fromBgr);
+        SummariseColours(rgb, ChannelOrder::Rgb, fromRgb);
+        EXPECT_EQ(std::memcmp(&fromBgr, &expected, sizeof(ColourStats)), 0) << bgr.size();
+        EXPECT_EQ(std::memcmp(&fromRgb, &expected, sizeof(ColourStats)), 0) << bgr.size();
+    }
 }
 
 TEST(MatrixSqrt, SquaresBackToTheRandomSymmetricPositiveInput) {
