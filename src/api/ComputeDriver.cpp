@@ -93,11 +93,16 @@ Status ComputeTransfersArray(const Engine* engine, const IImage* content, TRANSF
 Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, TRANSFER& out,
                                    const VoraParameters& params) {
     if (!content || !style) return STATUS_INVALID_ARGUMENT;
-    // Each summary sums in image order on one thread; side by side, the two
-    // keep both cores busy.
+    // A summary's second step sums in image order on one thread; the style's
+    // first step runs beside it, and the content's chroma is freed before
+    // the style's is complete, so the two never hold all of theirs at once.
     ColourStats contentStats{};
     ColourStats styleStats{};
-    tbb::parallel_invoke([&] { contentStats = Summarise(content); }, [&] { styleStats = Summarise(style); });
+    PendingSummaryPtr pendingContent = BeginSummary(RgbView(content), ChannelOrder::Rgb);
+    PendingSummaryPtr pendingStyle;
+    tbb::parallel_invoke([&] { FinishSummary(std::move(pendingContent), contentStats); },
+                         [&] { pendingStyle = BeginSummary(RgbView(style), ChannelOrder::Rgb); });
+    FinishSummary(std::move(pendingStyle), styleStats);
 
     out.clusterIndex = -1;
     out.styleIndex = -1;

@@ -281,18 +281,26 @@ void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrder order) {
     });
 }
 
-void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats) {
-    CV_Assert(pixels8.type() == CV_8UC3 && !pixels8.empty());
-    const int pixels = pixels8.rows * pixels8.cols;
-    // Every pixel's (a*, b*), kept for the second pass: 8 bytes a pixel.
-    const PairBuffer pairs(2 * pixels8.total());
+// Everything the second step needs from the first.
+struct PendingSummary {
+    explicit PendingSummary(size_t pixels) : pixels(pixels), pairs(2 * pixels) {}
+    size_t pixels;
+    PairBuffer pairs;  // every pixel's (a*, b*): 8 bytes a pixel
+    float meanA = 0.0f, meanB = 0.0f;
+    std::vector<int64_t> entryCounts;
+};
 
-    // Pass 1: the chroma sums in image order, in float, from the first pixel
-    // on, as OpenCV's row reduction forms them.
+void PendingSummaryDeleter::operator()(PendingSummary* pending) const { delete pending; }
+
+PendingSummaryPtr BeginSummary(const cv::Mat& pixels8, ChannelOrder order) {
+    CV_Assert(pixels8.type() == CV_8UC3 && !pixels8.empty());
+    PendingSummaryPtr pending(new PendingSummary(pixels8.total()));
+
+    // The chroma sums in image order, in float, from the first pixel on, as
+    // OpenCV's row reduction forms them.
     float sumA = 0.0f, sumB = 0.0f;
     bool first = true;
-    std::vector<int64_t> entryCounts;
-    ConvertInBands(pixels8, order, pairs.get(), entryCounts, [&](const float* band, size_t count) {
+    ConvertInBands(pixels8, order, pending->pairs.get(), pending->entryCounts, [&](const float* band, size_t count) {
         if (first) {
             sumA = band[0];
             sumB = band[1];
@@ -303,31 +311,41 @@ void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& s
         }
     });
     // The average: the float sum times the float of 1/n, plus a zero offset.
+    const int pixels = pixels8.rows * pixels8.cols;
     const float scale = static_cast<float>(1.0 / pixels);
-    const float meanA = sumA * scale + 0.0f;
-    const float meanB = sumB * scale + 0.0f;
+    pending->meanA = sumA * scale + 0.0f;
+    pending->meanB = sumB * scale + 0.0f;
+    return pending;
+}
 
-    // Pass 2: the products of the centred values (float differences, exact
-    // products in double) summed in image order, as OpenCV's transposed
-    // product forms each entry of the upper triangle.
-    const CentredProducts sums = SumCentredProducts(pairs.get(), pixels8.total(), meanA, meanB);
-    const double sumAA = sums.aa, sumAB = sums.ab, sumBB = sums.bb;
-    const double sampleScale = 1.0 / pixels;
+void FinishSummary(PendingSummaryPtr pending, ColourStats& stats) {
+    CV_Assert(pending != nullptr);
+    // The products of the centred values (float differences, exact products
+    // in double) summed in image order, as OpenCV's transposed product forms
+    // each entry of the upper triangle.
+    const CentredProducts sums = SumCentredProducts(pending->pairs.get(), pending->pixels, pending->meanA, pending->meanB);
+    const double sampleScale = 1.0 / static_cast<int>(pending->pixels);
     cv::Mat covariance(2, 2, CV_32F);
-    covariance.at<float>(0, 0) = static_cast<float>(sumAA * sampleScale);
-    covariance.at<float>(0, 1) = covariance.at<float>(1, 0) = static_cast<float>(sumAB * sampleScale);
-    covariance.at<float>(1, 1) = static_cast<float>(sumBB * sampleScale);
+    covariance.at<float>(0, 0) = static_cast<float>(sums.aa * sampleScale);
+    covariance.at<float>(0, 1) = covariance.at<float>(1, 0) = static_cast<float>(sums.ab * sampleScale);
+    covariance.at<float>(1, 1) = static_cast<float>(sums.bb * sampleScale);
 
-    stats.chromaMean[0] = meanA;
-    stats.chromaMean[1] = meanB;
+    stats.chromaMean[0] = pending->meanA;
+    stats.chromaMean[1] = pending->meanB;
     cv::Mat root;
     MatrixSqrt(covariance, root);
     for (int i = 0; i < 4; ++i) stats.chromaSqrtCov[i] = root.at<float>(i / 2, i % 2);
 
     const LightnessLevels& levels = Levels();
     std::vector<int64_t> counts(levels.Count(), 0);
-    for (size_t entry = 0; entry < kTableSize; ++entry) counts[levels.LevelOfEntry(entry)] += entryCounts[entry];
+    for (size_t entry = 0; entry < kTableSize; ++entry)
+        counts[levels.LevelOfEntry(entry)] += pending->entryCounts[entry];
+    pending.reset();  // the pairs go before the lightness statistics allocate
     LightnessStatsFromCounts(counts, stats);
+}
+
+void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats) {
+    FinishSummary(BeginSummary(pixels8, order), stats);
 }
 
 int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats) {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <memory>
+
 #include <opencv2/core.hpp>
 
 #include "KitApi.h"
@@ -34,6 +36,18 @@ VORA_KIT_API void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrde
 // and lightness counts per thread (24 KiB). The image must hold at least one
 // pixel.
 VORA_KIT_API void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats);
+
+// The same in two steps, for a caller that runs one image's second step
+// beside another's first: BeginSummary converts the pixels on all threads
+// and keeps their chroma; FinishSummary sums it again on the calling thread,
+// frees it and fills stats.
+struct PendingSummary;
+struct PendingSummaryDeleter {
+    void operator()(PendingSummary* pending) const;
+};
+using PendingSummaryPtr = std::unique_ptr<PendingSummary, PendingSummaryDeleter>;
+VORA_KIT_API PendingSummaryPtr BeginSummary(const cv::Mat& pixels8, ChannelOrder order);
+VORA_KIT_API void FinishSummary(PendingSummaryPtr pending, ColourStats& stats);
 
 // Entries 0..5. The image must hold at least one pixel. Returns 0.
 VORA_KIT_API int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);

@@ -104,12 +104,8 @@ private:
 };
 
 ColourStats StyleStats(const cv::Mat& bgr8) {
-    cv::Mat lab;
-    lab.create(bgr8.rows, bgr8.cols, CV_32FC3);
-    ConvertToLab(bgr8, lab);
     ColourStats stats{};
-    ComputeChromaStats(lab, stats);
-    ComputeLightnessStats(lab, stats);
+    SummariseColours(bgr8, ChannelOrder::Bgr, stats);
     return stats;
 }
 
