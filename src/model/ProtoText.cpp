@@ -302,9 +302,16 @@ private:
             into.fields.push_back(ParseScalar(name));
     }
 
+    // The reader recurses once per level: the limit keeps a hostile file
+    // from exhausting the stack.
     Message ParseBlock() {
         const Token open = m_tokens.Take();
-        return ParseFields(IsSymbol(open, '{') ? '}' : '>');
+        if (m_depth == kMaxNesting)
+            m_tokens.Fail(open, "blocks nested deeper than " + std::to_string(kMaxNesting) + " levels");
+        ++m_depth;
+        Message message = ParseFields(IsSymbol(open, '{') ? '}' : '>');
+        --m_depth;
+        return message;
     }
 
     Field ParseScalar(const std::string& name) {
@@ -315,6 +322,7 @@ private:
     }
 
     Tokenizer m_tokens;
+    int m_depth = 0;
 };
 
 void WriteQuoted(std::string& out, const std::string& value) {

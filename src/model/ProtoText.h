@@ -40,6 +40,9 @@ struct Field {
     static Field MakeMessage(std::string name, Message message);
 };
 
+// Blocks nest at most this deep; deeper text is refused as a parse error.
+constexpr int kMaxNesting = 100;
+
 // Throws cv::Exception (StsParseError) with the line and column of the fault.
 Message Parse(const std::string& text);
 

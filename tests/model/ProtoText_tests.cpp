@@ -65,5 +65,30 @@ TEST(ProtoText, ReportsWhereTheTextIsMalformed) {
     }
 }
 
+// Nesting is limited so a small hostile file cannot exhaust the stack: the
+// limit itself is read, one level more is refused, and 20,000 levels (which
+// overflowed the stack) are refused with the line and column.
+TEST(ProtoText, RefusesNestingBeyondTheLimit) {
+    const auto nested = [](int levels, const char* open, const char* close) {
+        std::string text;
+        for (int i = 0; i < levels; ++i) text += std::string("a ") + open;
+        text += " v: 1 ";
+        for (int i = 0; i < levels; ++i) text += close;
+        return text;
+    };
+    pt::Message deepest = pt::Parse(nested(pt::kMaxNesting, "{", "}"));
+    for (int i = 0; i < pt::kMaxNesting; ++i) deepest = pt::Message(deepest.fields.at(0).message);
+    EXPECT_EQ(Flat(deepest), " v:1");
+    for (const int levels : {pt::kMaxNesting + 1, 20000}) {
+        try {
+            pt::Parse(nested(levels, "<", ">"));
+            ADD_FAILURE() << levels << " levels accepted";
+        } catch (const cv::Exception& e) {
+            EXPECT_NE(e.err.find("nested deeper than 100 levels"), std::string::npos) << e.err;
+            EXPECT_NE(e.err.find("column 303"), std::string::npos) << e.err;
+        }
+    }
+}
+
 }  // namespace
 }  // namespace vora
