@@ -21,8 +21,14 @@ std::string DataFilePath(const std::string& modelDir, const char* name);
 
 // The readers take every count from the file's own header. Tables are
 // zero-filled before reading and reads are not checked, so a file shorter than
-// its header promises leaves a zero tail without an error. A negative count in
-// the cluster or style file is read as 0 (empty table, count 0).
+// its header promises leaves a zero tail without an error. That tail may be as
+// large as the file itself or 16 MiB, whichever is larger; a count that needs
+// more is refused before anything is allocated (the cluster file as an empty
+// table with count 0, the style file as SizeMismatch with count 0, the scores
+// and distance files as SizeMismatch), so memory follows the file, not what its
+// header claims. A header of fewer than 4 bytes reads as 0, as an empty file
+// does. A negative count in the cluster or style file is read as 0 (empty
+// table, count 0).
 
 // Cluster centres and count. A missing file leaves both untouched.
 void ReadClusterCentres(Engine& engine, const std::string& modelDir);

@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <chrono>
 #include <functional>
 #include <memory>
 #include <string>
@@ -106,6 +107,31 @@ TEST(StyleDatabase, OverflowingScoreCountsAreRejectedWithoutAllocating) {
     engine.clusterCount = engine.styleCount = 70000;
     EXPECT_EQ(ReadScoresAndDistances(engine, model.modelDir()), ReadResult::SizeMismatch);
     EXPECT_TRUE(engine.rankedStyles.empty());
+}
+
+// Counts a small file cannot stand for are refused before anything is
+// allocated: a partial header, a million clusters in 166 kB, and four
+// agreeing headers of 15,000 (which cost 3 GB and 103 s).
+TEST(StyleDatabase, CountsBeyondTheFileAreRefusedBeforeAllocating) {
+    const auto started = std::chrono::steady_clock::now();
+    const auto [partial, partialResult] = Read(RandomDatabase(2, 3), [](const ModelFixture& model) {
+        fixtures::WriteBytes(model.DataFile(kClusterFileName), std::string("\xff\xff\x7f", 3));
+    });
+    EXPECT_EQ(partial->clusterCount, 0);
+    EXPECT_TRUE(partial->clusterCentres.empty());
+
+    const auto [million, millionResult] = Read(RandomDatabase(2, 3), [](const ModelFixture& model) {
+        fixtures::WriteDataFile(model.DataFile(kClusterFileName), {1000000}, std::vector<float>(41500, 0.5f));
+    });
+    EXPECT_TRUE(million->clusterCount == 0 && million->clusterCentres.empty());
+
+    FixtureOptions agreeing = RandomDatabase(0, 0);
+    agreeing.clusterCount = agreeing.styleCount = agreeing.scoreRows = agreeing.scoreColumns =
+        agreeing.distanceCount = 15000;
+    const auto [engine, result] = Read(agreeing);
+    EXPECT_EQ(result, ReadResult::SizeMismatch);
+    EXPECT_TRUE(engine->clusterCentres.empty() && engine->rankedStyles.empty() && engine->styleDistances.empty());
+    EXPECT_LT(std::chrono::steady_clock::now() - started, std::chrono::seconds(5));
 }
 
 }  // namespace
