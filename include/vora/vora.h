@@ -98,6 +98,9 @@ enum Status : int32_t {
     STATUS_NO_USABLE_STYLE = 4,
     /// A style index outside the style database.
     STATUS_STYLE_INDEX_OUT_OF_RANGE = 5,
+    /// A solved transfer holds a value that is not a finite number (a style
+    /// record holding NaN or infinity, for example); nothing is written.
+    STATUS_NON_FINITE_RESULT = 6,
 };
 
 /// Rectangle of four doubles, edges inclusive as for pixel indices.

@@ -1,6 +1,8 @@
 #include "api/ComputeDriver.h"
 
+#include <algorithm>
 #include <array>
+#include <cmath>
 #include <cstdint>
 
 #include <opencv2/core.hpp>
@@ -25,6 +27,25 @@ cv::Mat LabOfRegion(const cv::Mat& rgb8, const cv::Rect& region) {
     cv::Mat lab(pixels.rows, pixels.cols, CV_32FC3);
     ConvertToLab(pixels, lab, ChannelOrder::Rgb);
     return lab;
+}
+
+bool AllFinite(const float* values, size_t count) {
+    for (size_t i = 0; i < count; ++i)
+        if (!std::isfinite(values[i])) return false;
+    return true;
+}
+
+// Whether every number of a record is finite: a caller is never handed a
+// transfer that would render NaN.
+bool IsFinite(const TRANSFER& t) {
+    bool finite = AllFinite(t.contentMean, 2) && AllFinite(t.styleMean, 2) && AllFinite(t.chromaMatrix, 4) &&
+                  AllFinite(t.toneCurve, 257) && std::isfinite(t.lightnessLow) && std::isfinite(t.lightnessHigh);
+    for (const FaceCorrection& f : t.faceCorrections) {
+        const float values[8] = {f.centreX, f.centreY, f.halfSizeX, f.halfSizeY,
+                                 f.measuredL, f.measuredA, f.measuredB, f.exponent};
+        finite = finite && AllFinite(values, 8);
+    }
+    return finite;
 }
 
 ColourStats Summarise(const IImage* image) {
@@ -60,14 +81,18 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
         SelectStyles(*engine, stats, clusterOrder, chosenClusters, chosenStyles, params);
     if (selected != STATUS_OK) return selected;
 
+    // Solved into copies, so a refused call leaves the caller's records as they were.
+    std::vector<TRANSFER> solved(out.begin(), out.begin() + params.numTransfers);
     for (uint32_t i = 0; i < params.numTransfers; ++i) {
-        TRANSFER& record = out[i];
+        TRANSFER& record = solved[i];
         record.clusterIndex = chosenClusters[i];
         record.styleIndex = chosenStyles[i];
         SolveTransfer(stats, engine->styleRecords[chosenStyles[i]], record, params);
         FinishTransfer(
             rgb8.size(), [&rgb8](const cv::Rect& region) { return LabOfRegion(rgb8, region); }, params, record);
+        if (!IsFinite(record)) return STATUS_NON_FINITE_RESULT;
     }
+    std::move(solved.begin(), solved.end(), out.begin());
     return STATUS_OK;
 }
 
@@ -104,9 +129,12 @@ Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, T
                          [&] { pendingStyle = BeginSummary(RgbView(style), ChannelOrder::Rgb); });
     FinishSummary(std::move(pendingStyle), styleStats);
 
-    out.clusterIndex = -1;
-    out.styleIndex = -1;
-    SolveTransfer(contentStats, styleStats, out, params);
+    TRANSFER solved = out;
+    solved.clusterIndex = -1;
+    solved.styleIndex = -1;
+    SolveTransfer(contentStats, styleStats, solved, params);
+    if (!IsFinite(solved)) return STATUS_NON_FINITE_RESULT;
+    out = std::move(solved);
     return STATUS_OK;
 }
 
@@ -117,9 +145,12 @@ Status ComputeTransferToStyleIndex(const Engine* engine, const IImage* content, 
         return STATUS_STYLE_INDEX_OUT_OF_RANGE;
 
     const ColourStats stats = Summarise(content);
-    out.clusterIndex = -1;
-    out.styleIndex = styleIndex;
-    SolveTransfer(stats, engine->styleRecords[styleIndex], out, params);
+    TRANSFER solved = out;
+    solved.clusterIndex = -1;
+    solved.styleIndex = styleIndex;
+    SolveTransfer(stats, engine->styleRecords[styleIndex], solved, params);
+    if (!IsFinite(solved)) return STATUS_NON_FINITE_RESULT;
+    out = std::move(solved);
     return STATUS_OK;
 }
 

@@ -71,6 +71,10 @@ std::unique_ptr<FeatureNetwork> FeatureNetwork::Load(const std::string& definiti
         CV_Error(cv::Error::StsError, "cannot read the network files " + definitionPath + " and " + weightsPath);
     }
 
+    // The dnn module reads an empty weights buffer as "no weights" and builds a
+    // network that fails only when run; refuse it here, where the model loads.
+    if (weights.empty()) CV_Error(cv::Error::StsError, "the network weights file " + weightsPath + " is empty");
+
     const PreparedDefinition prepared = PrepareDefinition(definition);
     std::unique_ptr<FeatureNetwork> network(new FeatureNetwork());
     network->m_transform = prepared.transform;

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <vector>
@@ -11,6 +12,9 @@
 namespace vora {
 
 bool ReadWholeFile(const std::string& path, std::string& bytes) {
+    // A directory opens as a stream that reads nothing: only regular files count.
+    std::error_code error;
+    if (!std::filesystem::is_regular_file(path, error)) return false;
     std::ifstream file(path, std::ios::binary);
     if (!file) return false;
     std::ostringstream buffer;

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <cstdlib>
 #include <filesystem>
+#include <limits>
 #include <string>
 
 #include <opencv2/core.hpp>
@@ -15,6 +16,7 @@
 #include <vora/vora.h>
 
 #include "color/WorkingOrder.h"
+#include "model/FeatureNetwork.h"
 #include "support/ModelFixtures.h"
 #include "support/TestImages.h"
 #include "transfer/ColourStatistics.h"
@@ -164,6 +166,21 @@ TEST_F(Refusals, ModelsAndSelectionsThatCannotServe) {
     for (int i = 0; i < 5; ++i) EXPECT_EQ(out[i].styleIndex, out[i % 2].styleIndex) << i;
 }
 
+// Style records holding NaN or infinity would solve to non-finite transfers:
+// every compute form refuses them and leaves the caller's record as it was.
+TEST_F(Refusals, NonFiniteStyleRecordsGiveNoTransfer) {
+    for (const float bad : {std::numeric_limits<float>::quiet_NaN(), std::numeric_limits<float>::infinity()}) {
+        FixtureOptions database = fixtures::RandomDatabase(2, 4);
+        for (ColourStats& style : database.styles) style.chromaSqrtCov[1] = bad;
+        EXPECT_EQ(Compute(database), STATUS_NON_FINITE_RESULT);
+        vora_api api = Api(database);
+        TRANSFER one;
+        one.styleIndex = 777;
+        EXPECT_EQ(api.compute_transfer(content.get(), 2, one, params), STATUS_NON_FINITE_RESULT);
+        EXPECT_EQ(one.styleIndex, 777);
+    }
+}
+
 TEST_F(Refusals, BadArgumentsAndDependencyErrors) {
     ModelFixture model(options);
     vora_api api(model.modelDir());
@@ -199,6 +216,19 @@ TEST_F(Refusals, BadArgumentsAndDependencyErrors) {
         const ModelFixture broken(options);
         EXPECT_THROW(vora_api{broken.modelDir()}, cv::Exception);
         EXPECT_THROW(CreateVoraObj(broken.modelDir().c_str()), cv::Exception);
+    }
+    // An empty weights file, or a directory in its place, is refused by the
+    // constructor too, not by the first compute.
+    options.network.files = Files::Valid;
+    for (const bool directory : {false, true}) {
+        const ModelFixture broken(options);
+        const std::string weights = broken.modelDir() + kNetworkFolder + kNetworkWeightsName;
+        std::filesystem::remove(weights);
+        if (directory)
+            std::filesystem::create_directory(weights);
+        else
+            fixtures::WriteBytes(weights, "");
+        EXPECT_THROW(vora_api{broken.modelDir()}, cv::Exception) << directory;
     }
 }
 

@@ -72,6 +72,9 @@ std::string StatusText(Status status) {
         return "the model offers no usable style for this photo's scene (see 'vora inspect')";
     case STATUS_STYLE_INDEX_OUT_OF_RANGE:
         return "the style index is outside the model's style database";
+    case STATUS_NON_FINITE_RESULT:
+        return "the transfer came out with values that are not finite numbers: the model's style records "
+               "hold NaN or infinity (see 'vora inspect')";
     }
     return "the library returned the unknown status " + std::to_string(static_cast<int>(status));
 }
