@@ -27,10 +27,12 @@ const char* const kHelp =
     "  --model DIR  model directory to open (the library needs one to render);\n"
     "               default: the one recorded in the file, else $VORA_MODEL,\n"
     "               else ./model\n"
-    "  --force      replace OUT if it exists, even if it is an input\n";
+    "  --force      replace OUT if it exists, even if it is an input\n"
+    "  --max-pixels N  refuse photos above N pixels before decoding them\n"
+    "               (default 128000000)\n";
 
 int Run(const std::vector<std::string>& args) {
-    ParsedArgs parsed("apply", {ValueOption("--model"), FlagOption("--force")}, args);
+    ParsedArgs parsed("apply", {ValueOption("--model"), FlagOption("--force"), ValueOption("--max-pixels")}, args);
     parsed.ExpectPositionals(3, 3, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
     const TransferReference reference = ParseTransferReference(parsed.positionals()[1]);
@@ -45,7 +47,7 @@ int Run(const std::vector<std::string>& args) {
     const std::string where = reference.path + ":" + std::to_string(reference.index);
     CheckRenderable(transfer, where);
 
-    Photo photo = ReadPhoto(photoPath);
+    Photo photo = ReadPhoto(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
 
     const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
     const auto api = OpenModel(modelDir);
@@ -63,7 +65,7 @@ int Run(const std::vector<std::string>& args) {
     ProgressBar bar("apply");
     RenderInPlace(*api, photo.pixels, transfer, &bar);
     bar.Finish();
-    WriteImage(outPath, photo.pixels);
+    WriteImage(outPath, photo.pixels, force);
     std::cout << outPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << where << " (style "
               << transfer.styleIndex << ", cluster " << transfer.clusterIndex << ")\n";
     return kExitOk;

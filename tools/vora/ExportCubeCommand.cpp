@@ -91,7 +91,7 @@ int Run(const std::vector<std::string>& args) {
         std::snprintf(line, sizeof line, "%.7f %.7f %.7f\n", p[0] / 255.0, p[1] / 255.0, p[2] / 255.0);
         text += line;
     }
-    WriteFileAtomically(outPath, text);
+    WriteFileAtomically(outPath, text, force);
     std::cout << outPath << ": " << size << " x " << size << " x " << size << " lookup table of " << where << "\n";
     return kExitOk;
 }

@@ -18,14 +18,16 @@ const char* const kHelp =
     "'vora suggest --faces' as it stands, after any correction by hand.\n"
     "\n"
     "  --detector hog|haar  hog: dlib's HOG frontal-face detector (the default of\n"
-    "                       --faces auto); haar: OpenCV's alt2 Haar cascade\n";
+    "                       --faces auto); haar: OpenCV's alt2 Haar cascade\n"
+    "  --max-pixels N       refuse photos above N pixels before decoding them\n"
+    "                       (default 128000000)\n";
 
 int Run(const std::vector<std::string>& args) {
-    ParsedArgs parsed("faces", {ValueOption("--detector")}, args);
+    ParsedArgs parsed("faces", {ValueOption("--detector"), ValueOption("--max-pixels")}, args);
     parsed.ExpectPositionals(1, 1, "faces PHOTO [--detector hog|haar]");
     FaceDetector detector = DefaultFaceDetector();
     if (auto name = parsed.Value("--detector")) detector = ParseFaceDetector(*name);
-    const Photo photo = ReadPhoto(parsed.positionals()[0]);
+    const Photo photo = ReadPhoto(parsed.positionals()[0], MaxPixelsOption(parsed.Value("--max-pixels")));
     const std::vector<DetectedFace> faces = DetectFaces(PackedRgb(photo), detector);
     for (const DetectedFace& face : faces) std::cout << FormatFaceBox(face.box) << "  " << face.score << "\n";
     std::cerr << faces.size() << (faces.size() == 1 ? " face" : " faces") << " found by "

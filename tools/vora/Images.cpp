@@ -15,6 +15,7 @@
 #include <opencv2/imgproc.hpp>
 
 #include "vora/Cli.h"
+#include "vora/ImageHeader.h"
 #include "vora/OutputFiles.h"
 
 namespace vora {
@@ -59,7 +60,12 @@ bool IsJpeg(const std::vector<uchar>& bytes) {
 
 }  // namespace
 
-Photo ReadPhoto(const std::string& path) {
+uint64_t MaxPixelsOption(const std::optional<std::string>& value) {
+    if (!value) return kDefaultMaxPixels;
+    return static_cast<uint64_t>(ParseInteger(*value, "--max-pixels", 1, 1LL << 40));
+}
+
+Photo ReadPhoto(const std::string& path, uint64_t maxPixels) {
     std::error_code ec;
     if (!std::filesystem::exists(path, ec)) throw Failure(path, "no such file");
     if (std::filesystem::is_directory(path, ec)) throw Failure(path, "is a directory, not an image");
@@ -68,6 +74,17 @@ Photo ReadPhoto(const std::string& path) {
     std::vector<uchar> bytes((std::istreambuf_iterator<char>(in)), std::istreambuf_iterator<char>());
     if (in.bad()) throw Failure(path, "cannot read file");
     if (bytes.empty()) throw Failure(path, "cannot read image (the file is empty)");
+
+    // The decoder allocates whatever the header says: a few hundred kilobytes
+    // of PNG can ask for gigabytes. The size is checked before it runs.
+    const std::optional<ImageSize> size = ReadImageSize(bytes);
+    if (!size) throw Failure(path, "cannot read image (not a JPEG, PNG, TIFF or WebP file, or damaged)");
+    if (size->width * size->height > maxPixels)
+        throw Failure(path, std::to_string(size->width) + " x " + std::to_string(size->height) + " is more than " +
+                                std::to_string(maxPixels) + " pixels; refusing to decode it (--max-pixels raises the limit)");
+    // A JPEG cut short decodes without an error, its missing rows streaked.
+    if (IsJpeg(bytes) && !JpegEndsWithEndMarker(bytes))
+        throw Failure(path, "cannot read image (the JPEG file is cut short: it has no end-of-image marker)");
 
     // JPEG carries no alpha, so it is decoded the ordinary way, which also
     // turns the picture upright as its EXIF orientation says. Other formats
@@ -136,7 +153,7 @@ void CheckImageExtension(const std::string& path) {
                      "' (the extension chooses it: .jpg, .png, .tif or .webp)");
 }
 
-void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba) {
+void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba, bool replace) {
     const std::string ext = LowerExtension(path);
     cv::Mat bgr;
     std::vector<int> params;
@@ -158,7 +175,7 @@ void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba) {
         throw Failure(path, "cannot encode image (" + e.err + ")");
     }
     if (!ok) throw Failure(path, "cannot encode image");
-    WriteFileAtomically(path, std::string(encoded.begin(), encoded.end()));
+    WriteFileAtomically(path, std::string(encoded.begin(), encoded.end()), replace);
 }
 
 }  // namespace cli

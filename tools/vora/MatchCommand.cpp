@@ -33,12 +33,14 @@ const char* const kHelp =
     "  --limit F        lightness move above which it is limited, x 0.2\n"
     "                   (default 1; >= 0)\n"
     "  --json FILE      also save the transfer, for 'vora apply' and 'vora export-cube'\n"
-    "  --force          replace existing output files, even inputs\n";
+    "  --force          replace existing output files, even inputs\n"
+    "  --max-pixels N   refuse images above N pixels before decoding them\n"
+    "                   (default 128000000)\n";
 
 int Run(const std::vector<std::string>& args) {
     ParsedArgs parsed("match",
                       {ValueOption("--model"), ValueOption("--solve"), ValueOption("--limit"), ValueOption("--json"),
-                       ValueOption("--style-index"), FlagOption("--force")},
+                       ValueOption("--style-index"), FlagOption("--force"), ValueOption("--max-pixels")},
                       args);
     const bool byIndex = parsed.Value("--style-index").has_value();
     parsed.ExpectPositionals(byIndex ? 2 : 3, byIndex ? 2 : 3, kSynopsis);
@@ -76,7 +78,8 @@ int Run(const std::vector<std::string>& args) {
                              std::to_string(model.styleCount - 1) + ")");
     }
 
-    Photo content = ReadPhoto(contentPath);
+    const uint64_t maxPixels = MaxPixelsOption(parsed.Value("--max-pixels"));
+    Photo content = ReadPhoto(contentPath, maxPixels);
     cv::Mat contentRgb = PackedRgb(content);  // compute only reads it
     const auto api = OpenModel(modelDir);
     ImageHandle contentImage = WrapWholeImage(contentRgb);
@@ -86,7 +89,7 @@ int Run(const std::vector<std::string>& args) {
         CheckStatus(api->compute_transfer(contentImage.get(), static_cast<int>(styleIndex), transfer, params),
                     contentPath);
     } else {
-        Photo style = ReadPhoto(stylePath);
+        Photo style = ReadPhoto(stylePath, maxPixels);
         cv::Mat styleRgb = PackedRgb(style);
         ImageHandle styleImage = WrapWholeImage(styleRgb);
         CheckStatus(api->compute_transfer(contentImage.get(), styleImage.get(), transfer, params), contentPath);
@@ -96,7 +99,7 @@ int Run(const std::vector<std::string>& args) {
     ProgressBar bar("match");
     RenderInPlace(*api, content.pixels, transfer, &bar);
     bar.Finish();
-    WriteImage(outPath, content.pixels);
+    WriteImage(outPath, content.pixels, force);
     std::cout << outPath << ": " << content.pixels.cols << " x " << content.pixels.rows << ", colours of "
               << (byIndex ? "style " + std::to_string(styleIndex) : stylePath) << "\n";
 
@@ -113,7 +116,7 @@ int Run(const std::vector<std::string>& args) {
         document.limitFactor = params.limitFactor;
         document.finishFactor = params.finishFactor;
         document.transfers.push_back(transfer);
-        WriteFileAtomically(jsonPath, SerializeTransfers(document));
+        WriteFileAtomically(jsonPath, SerializeTransfers(document), force);
         std::cout << jsonPath << ": the transfer\n";
     }
     return kExitOk;

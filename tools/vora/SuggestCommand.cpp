@@ -51,7 +51,9 @@ const char* const kHelp =
     "  --solve F            floor of the photo's colour spread, x 15 (default 1; > 0)\n"
     "  --limit F            lightness move above which it is limited, x 0.2 (default 1; >= 0)\n"
     "  --finish F           lightness faces are lifted toward, x 0.5 (default 1; 0 to 2)\n"
-    "  --force              replace files that exist in the output folder\n";
+    "  --force              replace files that exist in the output folder\n"
+    "  --max-pixels N       refuse photos above N pixels before decoding them\n"
+    "                       (default 128000000)\n";
 
 std::string Lower(std::string s) {
     std::transform(s.begin(), s.end(), s.begin(), [](unsigned char c) { return std::tolower(c); });
@@ -77,7 +79,8 @@ int Run(const std::vector<std::string>& args) {
     ParsedArgs parsed("suggest",
                       {ValueOption("-n"), ValueOption("--model"), RepeatedOption("--faces"), ValueOption("--detector"),
                        ValueOption("--out"), ValueOption("--format"), ValueOption("--ranking"), ValueOption("--solve"),
-                       ValueOption("--limit"), ValueOption("--finish"), FlagOption("--force")},
+                       ValueOption("--limit"), ValueOption("--finish"), FlagOption("--force"),
+                       ValueOption("--max-pixels")},
                       args);
     parsed.ExpectPositionals(1, 1, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
@@ -128,7 +131,7 @@ int Run(const std::vector<std::string>& args) {
                          std::to_string(model.stylesPerCluster()) +
                          " styles this model keeps per scene; proposals would repeat");
 
-    Photo photo = ReadPhoto(photoPath);
+    Photo photo = ReadPhoto(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
     cv::Mat rgb = PackedRgb(photo);  // compute reads packed R, G, B only
 
     TransferDocument document;
@@ -173,8 +176,13 @@ int Run(const std::vector<std::string>& args) {
         CheckRenderable(document.transfers[k], photoPath + ": proposal " + std::to_string(k));
 
     std::cout << photoPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << faceNote << "\n";
-    fs::create_directories(outDir, ec);
-    if (!fs::is_directory(outDir, ec)) throw Failure(outDir.string(), "cannot make the output folder");
+    // The set is written into a staging folder and moved into place at the
+    // end: a failure midway (a full disk) or an interrupt leaves nothing, so
+    // the command can simply be run again.
+    StagingFolder staging(outDir.string());
+    const auto staged = [&staging](const std::string& path) {
+        return staging.PathFor(fs::path(path).filename().string());
+    };
 
     std::vector<SheetEntry> sheet;
     sheet.push_back({MakeThumbnail(photo.pixels, kThumbnailSide), "original", stem});
@@ -184,7 +192,7 @@ int Run(const std::vector<std::string>& args) {
         const TRANSFER& t = document.transfers[k];
         cv::Mat rendered = photo.pixels.clone();
         RenderInPlace(*api, rendered, t, &bar, share * k, share * (k + 1));
-        WriteImage(proposalPaths[k], rendered);
+        WriteImage(staged(proposalPaths[k]), rendered, false);
         sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),
                          "#" + std::to_string(k) + "  style " + std::to_string(t.styleIndex),
                          "cluster " + std::to_string(t.clusterIndex) +
@@ -193,13 +201,14 @@ int Run(const std::vector<std::string>& args) {
                                   : ", " + std::to_string(t.faceCorrections.size()) + " face(s) lifted")});
     }
     bar.Finish();
+
+    const std::string heading = fs::path(photoPath).filename().string() + "  |  " + faceNote + "  |  model " + modelDir;
+    WriteImage(staged(sheetPath), ComposeContactSheet(heading, sheet, document.faces), false);
+    WriteFileAtomically(staged(jsonPath), SerializeTransfers(document), false);
+    staging.Commit(force);
     for (size_t k = 0; k < document.transfers.size(); ++k)
         std::cout << "  " << k << "  style " << document.transfers[k].styleIndex << "  cluster "
                   << document.transfers[k].clusterIndex << "  " << proposalPaths[k] << "\n";
-
-    const std::string heading = fs::path(photoPath).filename().string() + "  |  " + faceNote + "  |  model " + modelDir;
-    WriteImage(sheetPath, ComposeContactSheet(heading, sheet, document.faces));
-    WriteFileAtomically(jsonPath, SerializeTransfers(document));
     std::cout << "contact sheet: " << sheetPath << "\ntransfers: " << jsonPath << "\n";
     return kExitOk;
 }

@@ -95,6 +95,9 @@ public:
 
     int32_t Int32(const Json& value, const std::string& where) const {
         if (!value.is_number_integer()) Fail(where, "expected a whole number");
+        // Read as signed, an unsigned number above 2^63 would wrap to a small one.
+        if (value.is_number_unsigned() && value.get<uint64_t>() > static_cast<uint64_t>(INT32_MAX))
+            Fail(where, "number out of the 32-bit range");
         const int64_t v = value.get<int64_t>();
         if (v < INT32_MIN || v > INT32_MAX) Fail(where, "number out of the 32-bit range");
         return static_cast<int32_t>(v);
@@ -159,6 +162,11 @@ TRANSFER DecodeTransfer(const Reader& r, const Json& j, const std::string& where
     t.lightnessHigh = r.Float(r.Field(j, "lightnessHigh", where), where + ".lightnessHigh");
     const Json& faces = r.Field(j, "faceCorrections", where);
     if (!faces.is_array()) r.Fail(where + ".faceCorrections", "expected an array");
+    // Apply visits, at every pixel, the faces whose boxes meet its row: a
+    // hostile count would cost minutes.
+    if (faces.size() > kMaxFaceCorrections)
+        r.Fail(where + ".faceCorrections", "holds " + std::to_string(faces.size()) + " face corrections; at most " +
+                                               std::to_string(kMaxFaceCorrections) + " are accepted");
     for (size_t i = 0; i < faces.size(); ++i) {
         const std::string at = where + ".faceCorrections[" + std::to_string(i) + "]";
         const Json& face = faces[i];
@@ -210,6 +218,11 @@ TransferDocument ParseTransfers(const std::string& text, const std::string& sour
         j = Json::parse(text);
     } catch (const Json::parse_error& e) {
         throw Failure(sourceName, "not a valid JSON document (at byte " + std::to_string(e.byte) + ")");
+    } catch (const Json::out_of_range&) {
+        // A number such as 1e400 overflows a double while parsing.
+        throw Failure(sourceName, "not a valid JSON document (a number beyond the range of a double)");
+    } catch (const Json::exception&) {
+        throw Failure(sourceName, "not a valid JSON document");
     }
     Reader r(sourceName);
     if (!j.is_object()) r.Fail("", "not a transfers file (the document is not a JSON object)");
@@ -248,6 +261,9 @@ TransferDocument ParseTransfers(const std::string& text, const std::string& sour
         if (faces.contains("source")) d.faceSource = r.String(faces["source"], "faces.source");
         const Json& rects = r.Field(faces, "rects", "faces");
         if (!rects.is_array()) r.Fail("faces.rects", "expected an array");
+        if (rects.size() > kMaxFaceCorrections)
+            r.Fail("faces.rects", "holds " + std::to_string(rects.size()) + " faces; at most " +
+                                      std::to_string(kMaxFaceCorrections) + " are accepted");
         for (size_t i = 0; i < rects.size(); ++i) {
             const std::string at = "faces.rects[" + std::to_string(i) + "]";
             if (!rects[i].is_object()) r.Fail(at, "expected an object");

@@ -7,6 +7,7 @@
 
 #include <vora/vora.h>
 
+#include <cstddef>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -16,6 +17,8 @@ namespace cli {
 
 constexpr int kTransferFormatVersion = 1;
 constexpr const char* kTransferFormatName = "vora-transfers";
+// The most face corrections (and faces) a transfers file may hold.
+constexpr size_t kMaxFaceCorrections = 256;
 
 struct FaceBox {
     double left = 0.0;

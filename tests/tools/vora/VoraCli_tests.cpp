@@ -31,6 +31,7 @@
 #include "support/ModelFixtures.h"
 #include "support/TestImages.h"
 #include "vora/Cli.h"
+#include "vora/OutputFiles.h"
 #include "vora/TransferJson.h"
 
 namespace {
@@ -144,6 +145,12 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
     vora::fixtures::WriteBytes(m_work + "/empty.png", "");
     vora::fixtures::WriteBytes(m_work + "/broken.json", "{\"format\": \"vora-transfers\", ");
     vora::fixtures::WriteBytes(m_work + "/future.json", "{\"format\": \"vora-transfers\", \"version\": 9}");
+    // A 16384 x 16384 PNG of a few hundred kilobytes (decoding it took 7 GB),
+    // and the first half of a JPEG (it rendered with streaks and exit 0).
+    ASSERT_TRUE(cv::imwrite(m_work + "/huge.png", cv::Mat(16384, 16384, CV_8UC1, cv::Scalar(9))));
+    std::vector<uchar> jpeg;
+    ASSERT_TRUE(cv::imencode(".jpg", cv::Mat(64, 64, CV_8UC3, cv::Scalar(10, 200, 30)), jpeg));
+    vora::fixtures::WriteBytes(m_work + "/half.jpg", std::string(jpeg.begin(), jpeg.begin() + jpeg.size() / 2));
     using Case = std::tuple<std::vector<std::string>, int, std::string>;  // arguments, status, mentions
     const std::vector<Case> cases = {
         // Usage errors exit 2.
@@ -180,7 +187,11 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
         {{"apply", "photo.png", "broken.json", "out.png", "--model", m}, 1, "broken.json: not a valid JSON"},
         {{"apply", "photo.png", "future.json", "out.png", "--model", m}, 1, "format version 9"},
         {{"suggest", "photo.png", "--model", m_work + "/nowhere"}, 1, "nowhere"},
-        {{"match", "photo.png", "photo.png", "missing/out.png", "--model", m}, 1, "does not exist"}};
+        {{"match", "photo.png", "photo.png", "missing/out.png", "--model", m}, 1, "does not exist"},
+        {{"suggest", "huge.png", "--model", m}, 1, "huge.png: 16384 x 16384 is more than 128000000 pixels"},
+        {{"apply", "huge.png", "t.json", "o.png", "--model", m, "--max-pixels", "1000"}, 1, "more than 1000 pixels"},
+        {{"apply", "photo.png", "t.json", "o.png", "--model", m, "--max-pixels", "0"}, 2, "--max-pixels"},
+        {{"match", "half.jpg", "photo.png", "o.png", "--model", m}, 1, "half.jpg: cannot read image (the JPEG file is cut short"}};
     for (const auto& [args, status, mentions] : cases) ExpectRefused(args, status, mentions);
     // --force lets an existing output go.
     const RunResult forced = Run({"apply", "photo.png", "t.json", "first.png", "--model", m, "--force"});
@@ -322,12 +333,91 @@ TEST(TransferJson, MalformedRecordsAreNamed) {
              {[](json& j) { j["transfers"][1]["faceCorrections"] = json::array({json::object()}); },
               "transfers[1].faceCorrections[0]: missing field \"centreX\""},
              {[](json& j) { j["transfers"][1]["lightnessHigh"] = 1e39; }, "32-bit float"},
-             {[](json& j) { j = json::array({1, 2}); }, "not a transfers file"}}) {
+             {[](json& j) { j = json::array({1, 2}); }, "not a transfers file"},
+             // Read as signed, this wrapped to -1.
+             {[](json& j) { j["transfers"][0]["clusterIndex"] = 18446744073709551615ull; },
+              "transfers[0].clusterIndex: number out of the 32-bit range"},
+             // 20,000 corrections made apply on 512 x 512 take a minute.
+             {[](json& j) {
+                  json face = {{"centreX", 0.5}, {"centreY", 0.5}, {"halfSizeX", 0.1}, {"halfSizeY", 0.1},
+                               {"measuredL", 0.2}, {"measuredA", 1}, {"measuredB", 2}, {"exponent", 0.6}};
+                  j["transfers"][0]["faceCorrections"] = json::array();
+                  for (int i = 0; i < 257; ++i) j["transfers"][0]["faceCorrections"].push_back(face);
+              },
+              "transfers[0].faceCorrections: holds 257 face corrections; at most 256 are accepted"}}) {
         json text = json::parse(good);
         change(text);
         EXPECT_THAT([&] { vora::cli::ParseTransfers(text.dump(), "t.json"); },
                     testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr(mentions)));
     }
+    // A number beyond a double escaped the parser as its own exception, naming no file.
+    std::string huge = good;
+    const size_t at = huge.find("\"lightnessLow\": ") + 16;
+    huge.replace(at, huge.find_first_of(",\n", at) - at, "1e400");
+    EXPECT_THAT([&] { vora::cli::ParseTransfers(huge, "t.json"); },
+                testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("beyond the range of a double")));
+}
+
+// =============================================================================
+// output files
+// =============================================================================
+
+std::string Contents(const std::string& path) {
+    std::ifstream file(path, std::ios::binary);
+    return std::string(std::istreambuf_iterator<char>(file), {});
+}
+
+size_t Entries(const std::string& folder) {
+    return static_cast<size_t>(std::distance(fs::directory_iterator(folder), fs::directory_iterator()));
+}
+
+// A file that appears at the output path after the check is never replaced
+// without --force (the rename used to replace it and exit 0); with it, it is.
+TEST(OutputFiles, TheFinalStepReplacesOnlyWhenAllowed) {
+    const std::string folder = vora::fixtures::MakeTempFolder(), path = folder + "/out.txt";
+    vora::fixtures::WriteBytes(path, "the user's");
+    EXPECT_THAT([&] { vora::cli::WriteFileAtomically(path, "ours", false); },
+                testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("already exists")));
+    EXPECT_EQ(Contents(path), "the user's");
+    EXPECT_EQ(Entries(folder), 1u);  // no temporary left
+    vora::cli::WriteFileAtomically(path, "ours", true);
+    EXPECT_EQ(Contents(path), "ours");
+    vora::fixtures::RemoveTree(folder);
+}
+
+// A set appears whole or not at all: in a new folder by one rename, in an
+// existing one file by file, taken back when one is in the way; abandoned, it
+// leaves nothing.
+TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
+    const std::string root = vora::fixtures::MakeTempFolder(), out = root + "/set";
+    {
+        vora::cli::StagingFolder abandoned(out);
+        vora::cli::WriteFileAtomically(abandoned.PathFor("a.txt"), "a", false);
+    }
+    EXPECT_EQ(Entries(root), 0u);
+    {
+        vora::cli::StagingFolder staging(out);
+        vora::cli::WriteFileAtomically(staging.PathFor("a.txt"), "a", false);
+        vora::cli::WriteFileAtomically(staging.PathFor("b.txt"), "b", false);
+        staging.Commit(false);
+    }
+    EXPECT_TRUE(Contents(out + "/a.txt") == "a" && Contents(out + "/b.txt") == "b" && Entries(root) == 1u);
+    fs::remove(out + "/a.txt");
+    {
+        vora::cli::StagingFolder staging(out);
+        vora::cli::WriteFileAtomically(staging.PathFor("a.txt"), "new a", false);
+        vora::cli::WriteFileAtomically(staging.PathFor("b.txt"), "new b", false);
+        EXPECT_THAT([&] { staging.Commit(false); },
+                    testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("nothing was written")));
+    }
+    EXPECT_TRUE(!fs::exists(out + "/a.txt") && Contents(out + "/b.txt") == "b" && Entries(root) == 1u);
+    {
+        vora::cli::StagingFolder staging(out);
+        vora::cli::WriteFileAtomically(staging.PathFor("b.txt"), "new b", false);
+        staging.Commit(true);
+    }
+    EXPECT_TRUE(Contents(out + "/b.txt") == "new b" && Entries(out) == 1u && Entries(root) == 1u);
+    vora::fixtures::RemoveTree(root);
 }
 
 // =============================================================================
