@@ -33,6 +33,24 @@ struct LabPixel {
     float b;
 };
 
+// From XYZ (X and Z not yet divided by the white point) to working Lab; the
+// common tail of both forms of the conversion.
+inline LabPixel LabFromXyz(float x, float y, float z, std::size_t& lightnessEntry) {
+    x = x * kInvWhiteX;
+    z = z * kInvWhiteZ;
+
+    const float fx = labTable[TableIndex(x)];
+    lightnessEntry = TableIndex(y);
+    const float fy = labTable[lightnessEntry];
+    const float fz = labTable[TableIndex(z)];
+
+    LabPixel lab;
+    lab.lightness01 = static_cast<float>((static_cast<double>(fy) * 116.0 - 16.0) / 100.0);
+    lab.a = static_cast<float>(static_cast<double>(fx - fy) * 500.0);
+    lab.b = static_cast<float>(static_cast<double>(fy - fz) * 200.0);
+    return lab;
+}
+
 // lightnessEntry receives the labTable entry the lightness comes from: an
 // image's lightness takes at most one value per entry.
 inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue, std::size_t& lightnessEntry) {
@@ -41,23 +59,10 @@ inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue, std::size_t& 
     const double g = gammaTable[TableIndex(static_cast<float>(green) / 255.0f)];
     const double b = gammaTable[TableIndex(static_cast<float>(blue) / 255.0f)];
 
-    float x = static_cast<float>(0.412453 * r + 0.35758 * g + 0.180423 * b);
+    const float x = static_cast<float>(0.412453 * r + 0.35758 * g + 0.180423 * b);
     const float y = static_cast<float>(0.212671 * r + 0.71516 * g + 0.072169 * b);
-    float z = static_cast<float>(0.019334 * r + 0.119193 * g + 0.950227 * b);
-    x = x * kInvWhiteX;
-    z = z * kInvWhiteZ;
-
-    const float fx = labTable[TableIndex(x)];
-    const std::size_t entryY = TableIndex(y);
-    const float fy = labTable[entryY];
-    const float fz = labTable[TableIndex(z)];
-
-    LabPixel lab;
-    lab.lightness01 = static_cast<float>((static_cast<double>(fy) * 116.0 - 16.0) / 100.0);
-    lab.a = static_cast<float>(static_cast<double>(fx - fy) * 500.0);
-    lab.b = static_cast<float>(static_cast<double>(fy - fz) * 200.0);
-    lightnessEntry = entryY;
-    return lab;
+    const float z = static_cast<float>(0.019334 * r + 0.119193 * g + 0.950227 * b);
+    return LabFromXyz(x, y, z, lightnessEntry);
 }
 
 inline LabPixel RgbToLab(uint8_t red, uint8_t green, uint8_t blue) {

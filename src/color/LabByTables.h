@@ -23,22 +23,10 @@ public:
 
     LabPixel operator()(uint8_t red, uint8_t green, uint8_t blue, std::size_t& lightnessEntry) const {
         // The sums in RgbToLab's order: (red + green) + blue.
-        float x = static_cast<float>(m_products[0][red] + m_products[1][green] + m_products[2][blue]);
+        const float x = static_cast<float>(m_products[0][red] + m_products[1][green] + m_products[2][blue]);
         const float y = static_cast<float>(m_products[3][red] + m_products[4][green] + m_products[5][blue]);
-        float z = static_cast<float>(m_products[6][red] + m_products[7][green] + m_products[8][blue]);
-        x = x * kInvWhiteX;
-        z = z * kInvWhiteZ;
-
-        const float fx = labTable[TableIndex(x)];
-        lightnessEntry = TableIndex(y);
-        const float fy = labTable[lightnessEntry];
-        const float fz = labTable[TableIndex(z)];
-
-        LabPixel lab;
-        lab.lightness01 = static_cast<float>((static_cast<double>(fy) * 116.0 - 16.0) / 100.0);
-        lab.a = static_cast<float>(static_cast<double>(fx - fy) * 500.0);
-        lab.b = static_cast<float>(static_cast<double>(fy - fz) * 200.0);
-        return lab;
+        const float z = static_cast<float>(m_products[6][red] + m_products[7][green] + m_products[8][blue]);
+        return LabFromXyz(x, y, z, lightnessEntry);
     }
 
 private:
