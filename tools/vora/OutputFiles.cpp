@@ -85,6 +85,10 @@ StagingFolder::StagingFolder(const std::string& outputFolder) : m_output(outputF
     if (output.filename().empty()) output = output.parent_path();
     fs::path parent = output.parent_path();
     if (parent.empty()) parent = ".";
+    // The output folder may be several levels new; its parent is made now
+    // (and kept), so the staging folder sits on the same file system.
+    std::error_code made;
+    fs::create_directories(parent, made);
     const std::string pattern = (parent / ("." + output.filename().string() + ".tmp-XXXXXX")).string();
     if (pattern.size() >= sizeof g_stagingFolder) throw Failure(outputFolder, "path too long");
     std::memcpy(g_stagingFolder, pattern.c_str(), pattern.size() + 1);

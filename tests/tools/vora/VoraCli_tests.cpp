@@ -417,6 +417,12 @@ TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
         staging.Commit(true);
     }
     EXPECT_TRUE(Contents(out + "/b.txt") == "new b" && Entries(out) == 1u && Entries(root) == 1u);
+    {
+        vora::cli::StagingFolder staging(root + "/new/deeper/set");  // parents made as needed
+        vora::cli::WriteFileAtomically(staging.PathFor("c.txt"), "c", false);
+        staging.Commit(false);
+    }
+    EXPECT_EQ(Contents(root + "/new/deeper/set/c.txt"), "c");
     vora::fixtures::RemoveTree(root);
 }
 
