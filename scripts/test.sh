@@ -3,8 +3,10 @@
 #  1. a release build and its tests, including the integration test on the
 #     sample photographs (fetched from Debian's archive into .cache/);
 #  2. the example host built against the installed package;
-#  3. the suite again under AddressSanitizer and UndefinedBehaviorSanitizer
-#     (VORA_SANITIZE=0 skips this pass; the corpus test runs in pass 1 only).
+#  3. the suite again under AddressSanitizer and UndefinedBehaviorSanitizer,
+#     built with the scalar colour kernels only, so that the suite runs on
+#     both the vector and the scalar path (VORA_SANITIZE=0 skips this pass;
+#     the corpus test runs in pass 1 only).
 set -euo pipefail
 root="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 cd "$root"
@@ -37,7 +39,7 @@ test -s build/host/restyled.png
 
 if [ "${VORA_SANITIZE:-1}" = "1" ]; then
     echo "== Sanitizer build and tests"
-    cmake -S . -B build-asan -DCMAKE_BUILD_TYPE=Debug -DVORA_SANITIZE=ON -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
+    cmake -S . -B build-asan -DCMAKE_BUILD_TYPE=Debug -DVORA_SANITIZE=ON -DVORA_FORCE_SCALAR=ON -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
     cmake --build build-asan -j "$jobs"
     ctest --test-dir build-asan --output-on-failure -j "$jobs" -E 'Retrieval.SampleCorpusFindsAlteredCopies'
 fi

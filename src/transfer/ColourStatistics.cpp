@@ -161,8 +161,6 @@ void ConvertInBands(const cv::Mat& pixels8, ChannelOrder order, float* pairs, st
     const int bands = (pixels8.rows + bandRows - 1) / bandRows;
     const LabByTables& convert = LabByTables::Get();
     tbb::enumerable_thread_specific<std::vector<int64_t>> threadCounts(std::vector<int64_t>(kTableSize, 0));
-    const int redOffset = order == ChannelOrder::Rgb ? 0 : 2;
-    const int blueOffset = 2 - redOffset;
     const size_t bandPixels = static_cast<size_t>(bandRows) * static_cast<size_t>(columns);
     const size_t total = pixels8.total();
 
@@ -180,16 +178,9 @@ void ConvertInBands(const cv::Mat& pixels8, ChannelOrder order, float* pairs, st
                     std::vector<int64_t>& counts = threadCounts.local();
                     float* out = pairs + 2 * bandPixels * static_cast<size_t>(band);
                     const int last = std::min(pixels8.rows, (band + 1) * bandRows);
-                    for (int row = band * bandRows; row < last; ++row) {
-                        const uint8_t* in = pixels8.ptr<uint8_t>(row);
-                        for (int c = 0; c < columns; ++c, in += 3, out += 2) {
-                            size_t entry;
-                            const LabPixel lab = convert(in[redOffset], in[1], in[blueOffset], entry);
-                            ++counts[entry];
-                            out[0] = lab.a;
-                            out[1] = lab.b;
-                        }
-                    }
+                    for (int row = band * bandRows; row < last; ++row, out += 2 * static_cast<size_t>(columns))
+                        convert.ChromaOfPixels(pixels8.ptr<uint8_t>(row), static_cast<size_t>(columns), order, out,
+                                               counts.data());
                     return band;
                 }) &
             tbb::make_filter<int, void>(tbb::filter_mode::serial_in_order, [&](int band) {
