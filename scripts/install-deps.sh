@@ -9,6 +9,7 @@ packages=(
     libopencv-objdetect-dev opencv-data
     libtbb-dev libgtest-dev libgmock-dev libbenchmark-dev zlib1g-dev
     nlohmann-json3-dev libdlib-dev
+    clang-14 libclang-rt-14-dev
 )
 
 missing=()

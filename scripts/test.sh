@@ -6,7 +6,11 @@
 #  3. the suite again under AddressSanitizer and UndefinedBehaviorSanitizer,
 #     built with the scalar colour kernels only, so that the suite runs on
 #     both the vector and the scalar path (VORA_SANITIZE=0 skips this pass;
-#     the corpus test runs in pass 1 only).
+#     the corpus test runs in pass 1 only);
+#  4. four threads sharing one facade under ThreadSanitizer (VORA_TSAN=0 skips);
+#  5. every fuzz target for a minute from its seeds, under AddressSanitizer and
+#     UndefinedBehaviorSanitizer (scripts/fuzz.sh; VORA_FUZZ_SECONDS sets the
+#     time, VORA_FUZZ=0 skips).
 set -euo pipefail
 root="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 cd "$root"
@@ -42,4 +46,17 @@ if [ "${VORA_SANITIZE:-1}" = "1" ]; then
     cmake -S . -B build-asan -DCMAKE_BUILD_TYPE=Debug -DVORA_SANITIZE=ON -DVORA_FORCE_SCALAR=ON -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
     cmake --build build-asan -j "$jobs"
     ctest --test-dir build-asan --output-on-failure -j "$jobs" -E 'Retrieval.SampleCorpusFindsAlteredCopies'
+fi
+
+if [ "${VORA_TSAN:-1}" = "1" ]; then
+    echo "== ThreadSanitizer: one facade shared by four threads"
+    cmake -S . -B build-tsan -DCMAKE_BUILD_TYPE=RelWithDebInfo -DVORA_THREAD_SANITIZER=ON \
+        -DVORA_BUILD_TOOLS=OFF -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
+    cmake --build build-tsan -j "$jobs" --target vora_api_tests
+    ctest --test-dir build-tsan --output-on-failure -R 'SharedFacade\.'
+fi
+
+if [ "${VORA_FUZZ:-1}" = "1" ]; then
+    echo "== Fuzzing"
+    bash scripts/fuzz.sh
 fi
