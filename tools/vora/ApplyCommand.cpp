@@ -50,7 +50,7 @@ int Run(const std::vector<std::string>& args) {
     Photo photo = ReadPhoto(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
 
     const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
-    const auto api = OpenModel(modelDir);
+    const auto api = OpenExaminedModel(modelDir);
 
     // Face corrections sit at normalised positions: on a photo of other
     // proportions they land on other parts of the picture.

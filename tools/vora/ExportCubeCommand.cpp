@@ -58,7 +58,7 @@ int Run(const std::vector<std::string>& args) {
     transfer.faceCorrections.clear();
 
     const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
-    const auto api = OpenModel(modelDir);
+    const auto api = OpenExaminedModel(modelDir);
 
     // One pixel per lattice point: red along a row, then green, then blue,
     // which is the order the .cube format lists them in.

@@ -8,6 +8,7 @@
 
 #include <unistd.h>
 
+#include "model/FeatureNetwork.h"
 #include "vora/Cli.h"
 #include "vora/ModelFiles.h"
 
@@ -133,8 +134,33 @@ cv::Mat TestPicture() {
 
 // Loads the network through the library, as any host would, and runs one
 // computation. Adds problems to the examination; returns a line for the report.
+std::unique_ptr<vora_api> OpenExaminedModel(const std::string& dir) {
+    RequireModelDirectory(dir);
+    const ModelExamination model = ExamineModelFiles(dir);
+    if (model.broken())
+        throw Failure(dir, "the model is broken: " + model.problems.front() + " (run 'vora inspect " + dir +
+                               "' for the full report)");
+    return OpenModel(dir);
+}
+
 std::string CheckModelNetwork(ModelExamination& model) {
     if (!model.definition.present || !model.weights.present) return "network: not loaded (files missing)";
+    if (model.broken()) {
+        // The facade would read the broken data files too; the network alone
+        // tells whether it loads.
+        try {
+            (void)FeatureNetwork::Load(model.definition.path, model.weights.path);
+        } catch (const cv::Exception& e) {
+            model.problems.push_back("the network does not load: " + e.err);
+            return "network: does not load";
+        } catch (const std::bad_alloc&) {
+            throw;
+        } catch (const std::exception& e) {
+            model.problems.push_back(std::string("the network does not load: ") + e.what());
+            return "network: does not load";
+        }
+        return "network: loads (no test computation: the data files are broken)";
+    }
     std::unique_ptr<vora_api> api;
     try {
         api = std::make_unique<vora_api>(WithTrailingSlash(model.dir));
@@ -145,7 +171,6 @@ std::string CheckModelNetwork(ModelExamination& model) {
         model.problems.push_back(std::string("the network does not load: ") + e.what());
         return "network: does not load";
     }
-    if (model.broken()) return "network: loads (no test computation: the data files are broken)";
 
     cv::Mat rgb = TestPicture();
     ImageHandle image = WrapWholeImage(rgb);

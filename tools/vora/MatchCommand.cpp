@@ -81,7 +81,7 @@ int Run(const std::vector<std::string>& args) {
     const uint64_t maxPixels = MaxPixelsOption(parsed.Value("--max-pixels"));
     Photo content = ReadPhoto(contentPath, maxPixels);
     cv::Mat contentRgb = PackedRgb(content);  // compute only reads it
-    const auto api = OpenModel(modelDir);
+    const auto api = OpenExaminedModel(modelDir);
     ImageHandle contentImage = WrapWholeImage(contentRgb);
 
     TRANSFER transfer;
