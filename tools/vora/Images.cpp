@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cctype>
+#include <cmath>
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
@@ -176,6 +177,17 @@ void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba, bool replace)
     }
     if (!ok) throw Failure(path, "cannot encode image");
     WriteFileAtomically(path, std::string(encoded.begin(), encoded.end()), replace);
+}
+
+cv::Mat ScaledToLongSide(const cv::Mat& pixels, int maxSide) {
+    const int longSide = std::max(pixels.cols, pixels.rows);
+    if (longSide <= maxSide) return pixels;
+    const double f = static_cast<double>(maxSide) / longSide;
+    const cv::Size size(std::max(1, static_cast<int>(std::lround(pixels.cols * f))),
+                        std::max(1, static_cast<int>(std::lround(pixels.rows * f))));
+    cv::Mat scaled;
+    cv::resize(pixels, scaled, size, 0, 0, cv::INTER_AREA);
+    return scaled;
 }
 
 }  // namespace cli

@@ -44,6 +44,11 @@ void CheckImageExtension(const std::string& path);
 // Encodes an RGB or RGBA image in the format named by path's extension, then
 // writes it atomically (replacing a file at path only when replace is true).
 // JPEG has no alpha: it is dropped with a notice.
+// The photo scaled down by area averaging so that its long side is `maxSide`
+// (the other side rounded, at least 1), alpha and all; the photo itself when
+// it is no larger.
+cv::Mat ScaledToLongSide(const cv::Mat& pixels, int maxSide);
+
 void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba, bool replace);
 
 }  // namespace cli

@@ -23,6 +23,8 @@ namespace fs = std::filesystem;
 
 constexpr long long kMaxProposals = 100;
 constexpr int kThumbnailSide = 420;
+// Proposals are for choosing a look; full resolution is what apply is for.
+constexpr int kDefaultPreviewSide = 2048;
 
 const char* const kSynopsis = "suggest PHOTO [options]";
 
@@ -30,7 +32,8 @@ const char* const kHelp =
     "usage: vora suggest PHOTO [options]\n"
     "\n"
     "Asks the library for N proposals of colour treatments for PHOTO, renders\n"
-    "each at full resolution and writes, in the output folder:\n"
+    "each on a preview (the photo scaled to a long side of 2048 pixels) and\n"
+    "writes, in the output folder:\n"
     "  STEM-K.EXT          proposal K (0 to N-1), K being its record in transfers.json\n"
     "  contact-sheet.png   the original and every proposal, labelled with style and\n"
     "                      cluster, faces outlined\n"
@@ -51,6 +54,10 @@ const char* const kHelp =
     "  --solve F            floor of the photo's colour spread, x 15 (default 1; > 0)\n"
     "  --limit F            lightness move above which it is limited, x 0.2 (default 1; >= 0)\n"
     "  --finish F           lightness faces are lifted toward, x 0.5 (default 1; 0 to 2)\n"
+    "  --preview N          long side of the previews in pixels, 16 to 65536\n"
+    "                       (default 2048); the transfers are computed on the\n"
+    "                       whole photo either way\n"
+    "  --full               render the proposals at full resolution instead\n"
     "  --force              replace files that exist in the output folder\n"
     "  --max-pixels N       refuse photos above N pixels before decoding them\n"
     "                       (default 128000000)\n";
@@ -80,7 +87,7 @@ int Run(const std::vector<std::string>& args) {
                       {ValueOption("-n"), ValueOption("--model"), RepeatedOption("--faces"), ValueOption("--detector"),
                        ValueOption("--out"), ValueOption("--format"), ValueOption("--ranking"), ValueOption("--solve"),
                        ValueOption("--limit"), ValueOption("--finish"), FlagOption("--force"),
-                       ValueOption("--max-pixels")},
+                       ValueOption("--max-pixels"), ValueOption("--preview"), FlagOption("--full")},
                       args);
     parsed.ExpectPositionals(1, 1, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
@@ -99,6 +106,12 @@ int Run(const std::vector<std::string>& args) {
         detector = ParseFaceDetector(*d);
         if (faceRequest.kind != FaceRequest::Auto) throw UsageError("--detector: only used with --faces auto");
     }
+    if (parsed.Flag("--full") && parsed.Value("--preview"))
+        throw UsageError("--full and --preview: choose one (--full renders at full resolution)");
+    const int previewSide = parsed.Flag("--full") ? 0
+                            : parsed.Value("--preview")
+                                ? static_cast<int>(ParseInteger(*parsed.Value("--preview"), "--preview", 16, 65536))
+                                : kDefaultPreviewSide;
     const std::string format = ChooseFormat(parsed.Value("--format").value_or(""), photoPath);
 
     // Outputs: every file is checked before any work.
@@ -184,13 +197,18 @@ int Run(const std::vector<std::string>& args) {
         return staging.PathFor(fs::path(path).filename().string());
     };
 
+    // Face corrections and tiles are placed in normalised coordinates, so a
+    // transfer renders a scaled copy as it renders the photo.
+    const cv::Mat shown = previewSide > 0 ? ScaledToLongSide(photo.pixels, previewSide) : photo.pixels;
+    if (shown.cols != photo.pixels.cols)
+        std::cout << "previews: " << shown.cols << " x " << shown.rows << " (--full for full resolution)\n";
     std::vector<SheetEntry> sheet;
-    sheet.push_back({MakeThumbnail(photo.pixels, kThumbnailSide), "original", stem});
+    sheet.push_back({MakeThumbnail(shown, kThumbnailSide), "original", stem});
     ProgressBar bar("suggest");
     const double share = 1.0 / static_cast<double>(document.transfers.size());
     for (size_t k = 0; k < document.transfers.size(); ++k) {
         const TRANSFER& t = document.transfers[k];
-        cv::Mat rendered = photo.pixels.clone();
+        cv::Mat rendered = shown.clone();
         RenderInPlace(*api, rendered, t, &bar, share * k, share * (k + 1));
         WriteImage(staged(proposalPaths[k]), rendered, false);
         sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),

@@ -162,6 +162,8 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
         // 12 styles: the library keeps the better 6 per cluster.
         {{"suggest", "photo.png", "--model", m, "-n", "7"}, 2, "6 styles"},
         {{"suggest", "photo.png", "--model", m, "--ranking", "nan"}, 2, "--ranking"},
+        {{"suggest", "photo.png", "--model", m, "--preview", "8"}, 2, "--preview"},
+        {{"suggest", "photo.png", "--model", m, "--full", "--preview", "100"}, 2, "choose one"},
         {{"suggest", "photo.png", "--model", m, "--solve", "0"}, 2, "--solve"},
         {{"suggest", "photo.png", "--model", m, "--limit", "inf"}, 2, "--limit"},
         {{"suggest", "photo.png", "--model", m, "--finish", "3"}, 2, "--finish"},
@@ -233,6 +235,24 @@ TEST_F(CliTest, SuggestAndApplyGiveTheLibrarysBytesAndRecords) {
         if (!expected[k].faceCorrections.empty()) lifted = k;
     }
     ASSERT_LT(lifted, 3u) << "the dark face should be lifted by at least one proposal";
+
+    // Previews: the same records, rendered on the photo scaled by area
+    // averaging to the long side asked for (160 x 120 -> 100 x 75).
+    const RunResult p = Run({"suggest", "photo.png", "--model", m_modelDir, "-n", "3", "--faces", kFace, "--out",
+                             "p", "--ranking", "0.5", "--finish", "1.5", "--preview", "100"});
+    ASSERT_EQ(p.status, 0) << p.err;
+    EXPECT_NE(p.out.find("previews: 100 x 75"), std::string::npos) << p.out;
+    cv::Mat preview;
+    cv::resize(m_photo, preview, cv::Size(100, 75), 0, 0, cv::INTER_AREA);
+    const vora::cli::TransferDocument previewed = vora::cli::ReadTransfersFile(m_work + "/p/transfers.json");
+    ASSERT_EQ(previewed.transfers.size(), 3u);
+    EXPECT_EQ(previewed.photoWidth, 160u);
+    for (size_t k = 0; k < 3; ++k) {
+        SCOPED_TRACE(k);
+        EXPECT_TRUE(SameRecord(previewed.transfers[k], expected[k]));
+        EXPECT_TRUE(SameBytes(ReadRgb(m_work + "/p/photo-" + std::to_string(k) + ".png"),
+                              ApplyDirect(m_api, preview, expected[k])));
+    }
 
     // apply, on every kind of photo; the face lift on the big one, which the
     // bands must place right. The model comes from the file.
