@@ -13,10 +13,10 @@ namespace vora {
 namespace cli {
 namespace {
 
-const char* const kSynopsis = "apply PHOTO TRANSFERS.json[:K] OUT [--model DIR] [--force]";
+const char* const kSynopsis = "apply PHOTO TRANSFERS.json[:K] OUT [--strength S] [--model DIR] [--force]";
 
 const char* const kHelp =
-    "usage: vora apply PHOTO TRANSFERS.json[:K] OUT [--model DIR] [--force]\n"
+    "usage: vora apply PHOTO TRANSFERS.json[:K] OUT [--strength S] [--model DIR] [--force]\n"
     "\n"
     "Renders record K (default 0) of a transfers file onto PHOTO at full\n"
     "resolution, tile by tile, and writes OUT in the format its extension names\n"
@@ -24,6 +24,8 @@ const char* const kHelp =
     "the transfer was computed for (face corrections are placed by their\n"
     "normalised position). An alpha channel passes through untouched.\n"
     "\n"
+    "  --strength S how much of the look to use, 0 to 1 (default 1): each colour\n"
+    "               byte becomes o + S x (restyled - o), rounded to nearest\n"
     "  --model DIR  model directory to open (the library needs one to render);\n"
     "               default: the one recorded in the file, else $VORA_MODEL,\n"
     "               else ./model\n"
@@ -32,12 +34,16 @@ const char* const kHelp =
     "               (default 128000000)\n";
 
 int Run(const std::vector<std::string>& args) {
-    ParsedArgs parsed("apply", {ValueOption("--model"), FlagOption("--force"), ValueOption("--max-pixels")}, args);
+    ParsedArgs parsed("apply",
+                      {ValueOption("--model"), FlagOption("--force"), ValueOption("--max-pixels"),
+                       ValueOption("--strength")},
+                      args);
     parsed.ExpectPositionals(3, 3, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
     const TransferReference reference = ParseTransferReference(parsed.positionals()[1]);
     const std::string outPath = parsed.positionals()[2];
     const bool force = parsed.Flag("--force");
+    const double strength = StrengthOption(parsed.Value("--strength"));
 
     CheckImageExtension(outPath);
     CheckOutputPath(outPath, {photoPath, reference.path}, force);
@@ -62,9 +68,12 @@ int Run(const std::vector<std::string>& args) {
                                     "corrections may be misplaced");
     }
 
+    // The original is kept only when it is mixed back in.
+    const cv::Mat original = strength < 1.0 ? photo.pixels.clone() : cv::Mat();
     ProgressBar bar("apply");
     RenderInPlace(*api, photo.pixels, transfer, &bar);
     bar.Finish();
+    MixWithOriginal(original, photo.pixels, strength);
     WriteImage(outPath, photo.pixels, force);
     std::cout << outPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << where << " (style "
               << transfer.styleIndex << ", cluster " << transfer.clusterIndex << ")\n";

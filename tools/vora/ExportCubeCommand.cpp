@@ -21,10 +21,11 @@ namespace {
 // finer than the 17, 33 or 65 that tables are used at.
 constexpr long long kMaxSize = 129;
 
-const char* const kSynopsis = "export-cube TRANSFERS.json[:K] OUT.cube [--size N] [--model DIR] [--force]";
+const char* const kSynopsis =
+    "export-cube TRANSFERS.json[:K] OUT.cube [--size N] [--strength S] [--model DIR] [--force]";
 
 const char* const kHelp =
-    "usage: vora export-cube TRANSFERS.json[:K] OUT.cube [--size N] [--model DIR] [--force]\n"
+    "usage: vora export-cube TRANSFERS.json[:K] OUT.cube [--size N] [--strength S] [--model DIR] [--force]\n"
     "\n"
     "Writes record K (default 0) of a transfers file as a 3D lookup table in the\n"
     ".cube format: N x N x N lattice points over the domain 0..1, red varying\n"
@@ -34,13 +35,24 @@ const char* const kHelp =
     "left out: a lookup table knows only colours.\n"
     "\n"
     "  --size N     lattice points per axis, 2 to 129 (default 33)\n"
+    "  --strength S how much of the look to use, 0 to 1 (default 1), mixed at each\n"
+    "               point exactly as 'vora apply --strength S' mixes a pixel\n"
     "  --model DIR  model directory to open (the library needs one to render);\n"
     "               default: the one recorded in the file, else $VORA_MODEL,\n"
     "               else ./model\n"
     "  --force      replace OUT.cube if it exists\n";
 
+std::string StrengthText(double strength) {
+    char text[32];
+    std::snprintf(text, sizeof text, "%.17g", strength);
+    return text;
+}
+
 int Run(const std::vector<std::string>& args) {
-    ParsedArgs parsed("export-cube", {ValueOption("--size"), ValueOption("--model"), FlagOption("--force")}, args);
+    ParsedArgs parsed("export-cube",
+                      {ValueOption("--size"), ValueOption("--model"), FlagOption("--force"), ValueOption("--strength")},
+                      args);
+    const double strength = StrengthOption(parsed.Value("--strength"));
     parsed.ExpectPositionals(2, 2, kSynopsis);
     const TransferReference reference = ParseTransferReference(parsed.positionals()[0]);
     const std::string outPath = parsed.positionals()[1];
@@ -74,12 +86,15 @@ int Run(const std::vector<std::string>& args) {
                 row[3 * r + 2] = level(b);
             }
         }
+    const cv::Mat original = lattice.clone();
     RenderInPlace(*api, lattice, transfer);
+    MixWithOriginal(original, lattice, strength);
 
     std::string text;
     text.reserve(n * n * n * 27 + 512);
     text += "# vora " VORA_VERSION_STRING ": " + where + " (style " + std::to_string(transfer.styleIndex) +
-            ", cluster " + std::to_string(transfer.clusterIndex) + "), face corrections left out\n";
+            ", cluster " + std::to_string(transfer.clusterIndex) + "), face corrections left out" +
+            (strength < 1.0 ? ", strength " + StrengthText(strength) : std::string()) + "\n";
     text += "# each point is the transfer of its colour rounded to 8 bits; values are bytes / 255\n";
     text += "TITLE \"vora style " + std::to_string(transfer.styleIndex) + "\"\n";
     text += "LUT_3D_SIZE " + std::to_string(size) + "\n";

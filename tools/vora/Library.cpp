@@ -1,10 +1,12 @@
 #include "vora/Library.h"
 
 #include <algorithm>
+#include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
 #include <iostream>
+#include <vector>
 
 #include <unistd.h>
 
@@ -134,6 +136,29 @@ cv::Mat TestPicture() {
 
 // Loads the network through the library, as any host would, and runs one
 // computation. Adds problems to the examination; returns a line for the report.
+double StrengthOption(const std::optional<std::string>& value) {
+    if (!value) return 1.0;
+    (void)ParseFactor(*value, "--strength", 0.0, false, 1.0);  // the checks and their messages
+    return std::strtod(value->c_str(), nullptr);                // the mix is in double: the value as written
+}
+
+void MixWithOriginal(const cv::Mat& original, cv::Mat& restyled, double strength) {
+    if (strength == 1.0) return;
+    // The result depends on the byte pair alone: one table for the call.
+    std::vector<uint8_t> mixed(256 * 256);
+    for (int o = 0; o < 256; ++o)
+        for (int r = 0; r < 256; ++r)
+            mixed[static_cast<size_t>(o) * 256 + static_cast<size_t>(r)] =
+                static_cast<uint8_t>(std::floor(o + strength * (r - o) + 0.5));
+    const int channels = restyled.channels();
+    for (int y = 0; y < restyled.rows; ++y) {
+        const uint8_t* from = original.ptr<uint8_t>(y);
+        uint8_t* to = restyled.ptr<uint8_t>(y);
+        for (int x = 0; x < restyled.cols; ++x, from += channels, to += channels)
+            for (int c = 0; c < 3; ++c) to[c] = mixed[static_cast<size_t>(from[c]) * 256 + to[c]];
+    }
+}
+
 std::unique_ptr<vora_api> OpenExaminedModel(const std::string& dir) {
     RequireModelDirectory(dir);
     const ModelExamination model = ExamineModelFiles(dir);

@@ -7,6 +7,7 @@
 #include <vora/vora.h>
 
 #include <memory>
+#include <optional>
 #include <string>
 
 #include <opencv2/core.hpp>
@@ -72,6 +73,17 @@ class ProgressBar;
 // fraction `from` to `to` as the bands are done.
 void RenderInPlace(const vora_api& api, cv::Mat& pixels, const TRANSFER& transfer, ProgressBar* bar = nullptr,
                    double from = 0.0, double to = 1.0);
+
+// --strength S: how much of a look to use, 0 (the original) to 1 (the whole
+// look, the default). Usage error outside [0, 1].
+double StrengthOption(const std::optional<std::string>& value);
+
+// Mixes restyled colours with the original ones: each colour byte becomes
+// floor(o + S x (r - o) + 0.5), o the original byte, r the restyled one, in
+// double precision; bytes from the fourth on (alpha) keep the restyled
+// image's, which are the original's. Nothing changes at S = 1. Both images
+// have the same size and type (8-bit, 3 or 4 channels).
+void MixWithOriginal(const cv::Mat& original, cv::Mat& restyled, double strength);
 
 // A progress bar on standard error, drawn only when it is a terminal.
 class ProgressBar {

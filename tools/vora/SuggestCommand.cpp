@@ -58,6 +58,7 @@ const char* const kHelp =
     "                       (default 2048); the transfers are computed on the\n"
     "                       whole photo either way\n"
     "  --full               render the proposals at full resolution instead\n"
+    "  --strength S         how much of each look to show, 0 to 1 (default 1)\n"
     "  --force              replace files that exist in the output folder\n"
     "  --max-pixels N       refuse photos above N pixels before decoding them\n"
     "                       (default 128000000)\n";
@@ -87,7 +88,8 @@ int Run(const std::vector<std::string>& args) {
                       {ValueOption("-n"), ValueOption("--model"), RepeatedOption("--faces"), ValueOption("--detector"),
                        ValueOption("--out"), ValueOption("--format"), ValueOption("--ranking"), ValueOption("--solve"),
                        ValueOption("--limit"), ValueOption("--finish"), FlagOption("--force"),
-                       ValueOption("--max-pixels"), ValueOption("--preview"), FlagOption("--full")},
+                       ValueOption("--max-pixels"), ValueOption("--preview"), FlagOption("--full"),
+                       ValueOption("--strength")},
                       args);
     parsed.ExpectPositionals(1, 1, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
@@ -112,6 +114,7 @@ int Run(const std::vector<std::string>& args) {
                             : parsed.Value("--preview")
                                 ? static_cast<int>(ParseInteger(*parsed.Value("--preview"), "--preview", 16, 65536))
                                 : kDefaultPreviewSide;
+    const double strength = StrengthOption(parsed.Value("--strength"));
     const std::string format = ChooseFormat(parsed.Value("--format").value_or(""), photoPath);
 
     // Outputs: every file is checked before any work.
@@ -210,6 +213,7 @@ int Run(const std::vector<std::string>& args) {
         const TRANSFER& t = document.transfers[k];
         cv::Mat rendered = shown.clone();
         RenderInPlace(*api, rendered, t, &bar, share * k, share * (k + 1));
+        MixWithOriginal(shown, rendered, strength);
         WriteImage(staged(proposalPaths[k]), rendered, false);
         sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),
                          "#" + std::to_string(k) + "  style " + std::to_string(t.styleIndex),

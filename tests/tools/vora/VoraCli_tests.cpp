@@ -102,6 +102,17 @@ cv::Mat ApplyDirect(const vora::vora_api& api, const cv::Mat& pixels, const vora
     return out;
 }
 
+// What --strength S documents: each colour byte o + S x (r - o), in double,
+// rounded half up.
+cv::Mat Mixed(const cv::Mat& original, const cv::Mat& restyled, double strength) {
+    cv::Mat out = restyled.clone();
+    for (size_t i = 0; i < out.total() * out.channels(); ++i) {
+        const double o = original.data[i], r = restyled.data[i];
+        out.data[i] = static_cast<uint8_t>(std::floor(o + strength * (r - o) + 0.5));
+    }
+    return out;
+}
+
 // The dark oval of SyntheticPhotoRgb, given as the face.
 const char* const kFace = "0.3,0.5,0.25,0.55";
 
@@ -568,10 +579,14 @@ TEST_F(CliTest, CubeHoldsTheToolsOwnColoursAtItsLatticePoints) {
               0);
     vora::TRANSFER colourOnly = vora::cli::ReadTransfersFile(m_work + "/s/transfers.json").transfers[1];
     colourOnly.faceCorrections.clear();  // a lookup table knows only colours
-    for (int size : {2, 17}) {
+    // At part strength each point is mixed as apply mixes a pixel.
+    for (const auto& [size, strength] : std::vector<std::pair<int, std::string>>{{2, "1"}, {17, "1"}, {9, "0.35"}}) {
         SCOPED_TRACE(size);
         const std::string name = "lut" + std::to_string(size) + ".cube";
-        ASSERT_EQ(Run({"export-cube", "s/transfers.json:1", name, "--size", std::to_string(size)}).status, 0);
+        ASSERT_EQ(Run({"export-cube", "s/transfers.json:1", name, "--size", std::to_string(size), "--strength",
+                       strength})
+                      .status,
+                  0);
         int declared = 0;
         std::vector<cv::Vec3d> domain, values;
         std::istringstream in(Slurp(m_work + "/" + name));
@@ -593,8 +608,25 @@ TEST_F(CliTest, CubeHoldsTheToolsOwnColoursAtItsLatticePoints) {
                 for (int r = 0; r < size; ++r) lattice.emplace_back(level(r), level(g), level(b));
         cv::Mat bytes;
         cv::Mat(values).convertTo(bytes, CV_8U, 255.0);  // each value is a byte / 255, to seven decimals
-        EXPECT_TRUE(SameBytes(bytes, ApplyDirect(m_api, cv::Mat(lattice), colourOnly)));
+        EXPECT_TRUE(SameBytes(bytes, Mixed(cv::Mat(lattice), ApplyDirect(m_api, cv::Mat(lattice), colourOnly),
+                                           std::stod(strength))));
     }
+}
+
+TEST_F(CliTest, StrengthMixesEachByteWithTheOriginal) {
+    ASSERT_EQ(Run({"match", "photo.png", "photo.png", "first.png", "--model", m_modelDir, "--json", "t.json"}).status, 0);
+    const vora::TRANSFER t = vora::cli::ReadTransfersFile(m_work + "/t.json").transfers[0];
+    const cv::Mat full = ApplyDirect(m_api, m_photo, t);
+    for (const char* strength : {"0", "0.35", "1"}) {
+        SCOPED_TRACE(strength);
+        const std::string out = std::string("s") + strength + ".png";
+        const RunResult r = Run({"apply", "photo.png", "t.json", out, "--strength", strength});
+        ASSERT_EQ(r.status, 0) << r.err;
+        EXPECT_TRUE(SameBytes(ReadRgb(m_work + "/" + out), Mixed(m_photo, full, std::stod(strength))));
+    }
+    ASSERT_FALSE(SameBytes(full, m_photo));  // so that strength 0 is a real test
+    for (const char* bad : {"1.5", "-0.1", "nan", "half"})
+        ExpectRefused({"apply", "photo.png", "t.json", "o.png", "--strength", bad}, 2, "--strength");
 }
 
 }  // namespace
