@@ -14,6 +14,9 @@ cmake -S . -B build-fuzz -DCMAKE_BUILD_TYPE=RelWithDebInfo -DCMAKE_CXX_COMPILER=
     -DVORA_BUILD_TESTS=OFF -DVORA_BUILD_TOOLS=OFF -DVORA_BUILD_BENCHMARKS=OFF >/dev/null
 cmake --build build-fuzz -j "$(nproc)" --target "${targets[@]}"
 
+# Leaks inside dependencies are not findings (tests/fuzz/lsan.supp says which).
+export LSAN_OPTIONS="suppressions=$root/tests/fuzz/lsan.supp${LSAN_OPTIONS:+:$LSAN_OPTIONS}"
+
 mkdir -p build-fuzz/findings
 total=0
 failed=()
