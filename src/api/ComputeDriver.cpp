@@ -29,25 +29,6 @@ cv::Mat LabOfRegion(const cv::Mat& rgb8, const cv::Rect& region) {
     return lab;
 }
 
-bool AllFinite(const float* values, size_t count) {
-    for (size_t i = 0; i < count; ++i)
-        if (!std::isfinite(values[i])) return false;
-    return true;
-}
-
-// Whether every number of a record is finite: a caller is never handed a
-// transfer that would render NaN.
-bool IsFinite(const TRANSFER& t) {
-    bool finite = AllFinite(t.contentMean, 2) && AllFinite(t.styleMean, 2) && AllFinite(t.chromaMatrix, 4) &&
-                  AllFinite(t.toneCurve, 257) && std::isfinite(t.lightnessLow) && std::isfinite(t.lightnessHigh);
-    for (const FaceCorrection& f : t.faceCorrections) {
-        const float values[8] = {f.centreX, f.centreY, f.halfSizeX, f.halfSizeY,
-                                 f.measuredL, f.measuredA, f.measuredB, f.exponent};
-        finite = finite && AllFinite(values, 8);
-    }
-    return finite;
-}
-
 ColourStats Summarise(const IImage* image) {
     ColourStats stats{};
     SummariseColours(RgbView(image), ChannelOrder::Rgb, stats);
@@ -90,7 +71,7 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
         SolveTransfer(stats, engine->styleRecords[chosenStyles[i]], record, params);
         FinishTransfer(
             rgb8.size(), [&rgb8](const cv::Rect& region) { return LabOfRegion(rgb8, region); }, params, record);
-        if (!IsFinite(record)) return STATUS_NON_FINITE_RESULT;
+        if (!TransferIsFinite(record)) return STATUS_NON_FINITE_RESULT;
     }
     std::move(solved.begin(), solved.end(), out.begin());
     return STATUS_OK;
@@ -133,7 +114,7 @@ Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, T
     solved.clusterIndex = -1;
     solved.styleIndex = -1;
     SolveTransfer(contentStats, styleStats, solved, params);
-    if (!IsFinite(solved)) return STATUS_NON_FINITE_RESULT;
+    if (!TransferIsFinite(solved)) return STATUS_NON_FINITE_RESULT;
     out = std::move(solved);
     return STATUS_OK;
 }
@@ -149,7 +130,7 @@ Status ComputeTransferToStyleIndex(const Engine* engine, const IImage* content, 
     solved.clusterIndex = -1;
     solved.styleIndex = styleIndex;
     SolveTransfer(stats, engine->styleRecords[styleIndex], solved, params);
-    if (!IsFinite(solved)) return STATUS_NON_FINITE_RESULT;
+    if (!TransferIsFinite(solved)) return STATUS_NON_FINITE_RESULT;
     out = std::move(solved);
     return STATUS_OK;
 }

@@ -113,4 +113,25 @@ int FinishTransfer(cv::Size size, const std::function<cv::Mat(const cv::Rect&)>&
     return 0;
 }
 
+namespace {
+
+bool AllFinite(const float* values, size_t count) {
+    for (size_t i = 0; i < count; ++i)
+        if (!std::isfinite(values[i])) return false;
+    return true;
+}
+
+}  // namespace
+
+bool TransferIsFinite(const TRANSFER& t) {
+    bool finite = AllFinite(t.contentMean, 2) && AllFinite(t.styleMean, 2) && AllFinite(t.chromaMatrix, 4) &&
+                  AllFinite(t.toneCurve, 257) && std::isfinite(t.lightnessLow) && std::isfinite(t.lightnessHigh);
+    for (const FaceCorrection& f : t.faceCorrections) {
+        const float values[8] = {f.centreX, f.centreY, f.halfSizeX, f.halfSizeY,
+                                 f.measuredL, f.measuredA, f.measuredB, f.exponent};
+        finite = finite && AllFinite(values, 8);
+    }
+    return finite;
+}
+
 }  // namespace vora

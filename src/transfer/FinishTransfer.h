@@ -6,6 +6,8 @@
 
 #include <vora/vora.h>
 
+#include "KitApi.h"
+
 namespace vora {
 
 // Measures each host face after the transfer and appends a correction for
@@ -23,6 +25,10 @@ int FinishTransfer(cv::Size size, const std::function<cv::Mat(const cv::Rect&)>&
 
 // The per-pixel transfer without the face lift, in matrix form. sample is
 // CV_32FC3 working Lab (may be a view); result receives a new matrix.
+// Whether every number of a record is finite, face corrections included: a
+// record with NaN or infinity would render garbage.
+VORA_KIT_API bool TransferIsFinite(const TRANSFER& transfer);
+
 void ApplyTransferToLab(const cv::Mat& sample, const TRANSFER& transfer, cv::Mat& result);
 
 }  // namespace vora

@@ -11,6 +11,7 @@
 
 #include <nlohmann/json.hpp>
 
+#include "transfer/FinishTransfer.h"
 #include "vora/Cli.h"
 
 namespace vora {
@@ -329,19 +330,8 @@ TRANSFER LoadTransferRecord(const TransferReference& reference, TransferDocument
 }
 
 void CheckRenderable(const TRANSFER& t, const std::string& where) {
-    auto finite = [](const float* v, size_t n) {
-        for (size_t i = 0; i < n; ++i)
-            if (!std::isfinite(v[i])) return false;
-        return true;
-    };
-    bool ok = finite(t.contentMean, 2) && finite(t.styleMean, 2) && finite(t.chromaMatrix, 4) &&
-              finite(t.toneCurve, 257) && std::isfinite(t.lightnessLow) && std::isfinite(t.lightnessHigh);
-    for (const FaceCorrection& f : t.faceCorrections) {
-        const float values[8] = {f.centreX, f.centreY, f.halfSizeX, f.halfSizeY,
-                                 f.measuredL, f.measuredA, f.measuredB, f.exponent};
-        ok = ok && finite(values, 8);
-    }
-    if (!ok) throw Failure(where, "the transfer holds values that are not finite numbers; it cannot be rendered");
+    if (!TransferIsFinite(t))
+        throw Failure(where, "the transfer holds values that are not finite numbers; it cannot be rendered");
 }
 
 }  // namespace cli
