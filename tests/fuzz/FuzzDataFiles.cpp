@@ -3,6 +3,7 @@
 // distance files. The readers report problems through their results and the
 // engine's counts, never by exception, so any exception is a finding; so is
 // a table that disagrees with its count.
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
