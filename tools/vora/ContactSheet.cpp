@@ -5,6 +5,8 @@
 
 #include <opencv2/imgproc.hpp>
 
+#include "vora/Images.h"
+
 namespace vora {
 namespace cli {
 namespace {
@@ -31,14 +33,7 @@ cv::Mat MakeThumbnail(const cv::Mat& rgbOrRgba, int maxSide) {
         cv::cvtColor(rgbOrRgba, rgb, cv::COLOR_RGBA2RGB);
     else
         rgb = rgbOrRgba;
-    const int longSide = std::max(rgb.cols, rgb.rows);
-    if (longSide <= maxSide) return rgb.clone();
-    const double f = static_cast<double>(maxSide) / longSide;
-    cv::Mat small;
-    const cv::Size size(std::max(1, static_cast<int>(std::lround(rgb.cols * f))),
-                        std::max(1, static_cast<int>(std::lround(rgb.rows * f))));
-    cv::resize(rgb, small, size, 0, 0, cv::INTER_AREA);
-    return small;
+    return ScaledToLongSide(rgb, maxSide).clone();  // its own pixels, whatever the caller does next
 }
 
 cv::Mat ComposeContactSheet(const std::string& heading, const std::vector<SheetEntry>& entries,
