@@ -10,6 +10,10 @@ packages=(
     libtbb-dev libgtest-dev libgmock-dev libbenchmark-dev zlib1g-dev
     nlohmann-json3-dev libdlib-dev
     clang-14 libclang-rt-14-dev
+    liblcms2-dev libexiv2-dev
+    # The tests' references: Little CMS's converters, free ICC profiles, and
+    # ffmpeg as an outside reader of the exported .cube.
+    liblcms2-utils icc-profiles-free ffmpeg
 )
 
 missing=()

@@ -13,10 +13,10 @@ namespace vora {
 namespace cli {
 namespace {
 
-const char* const kSynopsis = "apply PHOTO TRANSFERS.json[:K] OUT [--strength S] [--model DIR] [--force]";
+const char* const kSynopsis = "apply PHOTO TRANSFERS.json[:K] OUT [options]";
 
 const char* const kHelp =
-    "usage: vora apply PHOTO TRANSFERS.json[:K] OUT [--strength S] [--model DIR] [--force]\n"
+    "usage: vora apply PHOTO TRANSFERS.json[:K] OUT [options]\n"
     "\n"
     "Renders record K (default 0) of a transfers file onto PHOTO at full\n"
     "resolution, tile by tile, and writes OUT in the format its extension names\n"
@@ -29,6 +29,8 @@ const char* const kHelp =
     "  --model DIR  model directory to open (the library needs one to render);\n"
     "               default: the one recorded in the file, else $VORA_MODEL,\n"
     "               else ./model\n"
+    "  --keep-profile  write OUT in PHOTO's own colour profile (default: sRGB)\n"
+    "  --strip-metadata  copy no EXIF, XMP or IPTC from PHOTO\n"
     "  --force      replace OUT if it exists, even if it is an input\n"
     "  --max-pixels N  refuse photos above N pixels before decoding them\n"
     "               (default 128000000)\n";
@@ -36,7 +38,7 @@ const char* const kHelp =
 int Run(const std::vector<std::string>& args) {
     ParsedArgs parsed("apply",
                       {ValueOption("--model"), FlagOption("--force"), ValueOption("--max-pixels"),
-                       ValueOption("--strength")},
+                       ValueOption("--strength"), FlagOption("--keep-profile"), FlagOption("--strip-metadata")},
                       args);
     parsed.ExpectPositionals(3, 3, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
@@ -74,7 +76,7 @@ int Run(const std::vector<std::string>& args) {
     RenderInPlace(*api, photo.pixels, transfer, &bar);
     bar.Finish();
     MixWithOriginal(original, photo.pixels, strength);
-    WriteImage(outPath, photo.pixels, force);
+    WriteImage(outPath, photo.pixels, force, ImageTagsFor(parsed, photo));
     std::cout << outPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << where << " (style "
               << transfer.styleIndex << ", cluster " << transfer.clusterIndex << ")\n";
     return kExitOk;

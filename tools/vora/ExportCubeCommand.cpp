@@ -95,6 +95,7 @@ int Run(const std::vector<std::string>& args) {
     text += "# vora " VORA_VERSION_STRING ": " + where + " (style " + std::to_string(transfer.styleIndex) +
             ", cluster " + std::to_string(transfer.clusterIndex) + "), face corrections left out" +
             (strength < 1.0 ? ", strength " + StrengthText(strength) : std::string()) + "\n";
+    text += "# maps sRGB to sRGB: input and output values are sRGB-encoded, as vora reads and writes photos\n";
     text += "# each point is the transfer of its colour rounded to 8 bits; values are bytes / 255\n";
     text += "TITLE \"vora style " + std::to_string(transfer.styleIndex) + "\"\n";
     text += "LUT_3D_SIZE " + std::to_string(size) + "\n";

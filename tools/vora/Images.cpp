@@ -135,6 +135,19 @@ Photo ReadPhoto(const std::string& path, uint64_t maxPixels) {
         throw Failure(path, "cannot read image (" + std::to_string(decoded.channels()) + " channels)");
     }
     if (!photo.pixels.isContinuous()) photo.pixels = photo.pixels.clone();
+
+    photo.storedGrey = decoded.channels() <= 2;
+    photo.metadata = ReadPhotoMetadata(bytes, path, &photo.profile.bytes);
+    if (!photo.profile.bytes.empty()) {
+        std::string why;
+        photo.profileKind = ExamineProfile(photo.profile, photo.storedGrey, &why);
+        if (photo.profileKind == ProfileKind::Unusable) {
+            PrintNotice(path + ": " + why + "; its pixels are taken as sRGB");
+        } else if (photo.profileKind == ProfileKind::Convertible) {
+            ConvertToSrgb(photo.pixels, photo.profile, photo.storedGrey);
+            PrintNotice(path + ": converted from " + photo.profile.name + " to sRGB");
+        }
+    }
     return photo;
 }
 
@@ -154,8 +167,22 @@ void CheckImageExtension(const std::string& path) {
                      "' (the extension chooses it: .jpg, .png, .tif or .webp)");
 }
 
-void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba, bool replace) {
+void WriteImage(const std::string& path, const cv::Mat& srgbPixels, bool replace, const ImageTags& tags) {
     const std::string ext = LowerExtension(path);
+    cv::Mat rgbOrRgba = srgbPixels;
+    std::string profile = SrgbProfileBytes();
+    const Photo* source = tags.source;
+    if (tags.keepProfile && source != nullptr && !source->profile.bytes.empty()) {
+        // A grey profile cannot describe colour pixels, and an unusable one
+        // was never applied: those outputs stay sRGB.
+        if (source->profileKind == ProfileKind::Convertible && !source->storedGrey) {
+            rgbOrRgba = srgbPixels.clone();
+            ConvertFromSrgb(rgbOrRgba, source->profile);
+            profile = source->profile.bytes;
+        } else if (source->profileKind == ProfileKind::Srgb && !source->storedGrey) {
+            profile = source->profile.bytes;
+        }
+    }
     cv::Mat bgr;
     std::vector<int> params;
     if (ext == ".jpg" || ext == ".jpeg") {
@@ -176,7 +203,23 @@ void WriteImage(const std::string& path, const cv::Mat& rgbOrRgba, bool replace)
         throw Failure(path, "cannot encode image (" + e.err + ")");
     }
     if (!ok) throw Failure(path, "cannot encode image");
+    OutputMetadata metadata;
+    metadata.source = source != nullptr ? source->metadata.get() : nullptr;
+    metadata.strip = tags.stripMetadata;
+    metadata.profile = profile;
+    metadata.width = srgbPixels.cols;
+    metadata.height = srgbPixels.rows;
+    metadata.alpha = bgr.channels() == 4;
+    encoded = WithMetadata(encoded, metadata, path);
     WriteFileAtomically(path, std::string(encoded.begin(), encoded.end()), replace);
+}
+
+ImageTags ImageTagsFor(const ParsedArgs& parsed, const Photo& source) {
+    ImageTags tags;
+    tags.source = &source;
+    tags.keepProfile = parsed.Flag("--keep-profile");
+    tags.stripMetadata = parsed.Flag("--strip-metadata");
+    return tags;
 }
 
 cv::Mat ScaledToLongSide(const cv::Mat& pixels, int maxSide) {

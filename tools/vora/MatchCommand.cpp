@@ -33,6 +33,8 @@ const char* const kHelp =
     "  --limit F        lightness move above which it is limited, x 0.2\n"
     "                   (default 1; >= 0)\n"
     "  --json FILE      also save the transfer, for 'vora apply' and 'vora export-cube'\n"
+    "  --keep-profile   write OUT in CONTENT's own colour profile (default: sRGB)\n"
+    "  --strip-metadata copy no EXIF, XMP or IPTC from CONTENT\n"
     "  --force          replace existing output files, even inputs\n"
     "  --max-pixels N   refuse images above N pixels before decoding them\n"
     "                   (default 128000000)\n";
@@ -40,7 +42,8 @@ const char* const kHelp =
 int Run(const std::vector<std::string>& args) {
     ParsedArgs parsed("match",
                       {ValueOption("--model"), ValueOption("--solve"), ValueOption("--limit"), ValueOption("--json"),
-                       ValueOption("--style-index"), FlagOption("--force"), ValueOption("--max-pixels")},
+                       ValueOption("--style-index"), FlagOption("--force"), ValueOption("--max-pixels"),
+                       FlagOption("--keep-profile"), FlagOption("--strip-metadata")},
                       args);
     const bool byIndex = parsed.Value("--style-index").has_value();
     parsed.ExpectPositionals(byIndex ? 2 : 3, byIndex ? 2 : 3, kSynopsis);
@@ -99,7 +102,7 @@ int Run(const std::vector<std::string>& args) {
     ProgressBar bar("match");
     RenderInPlace(*api, content.pixels, transfer, &bar);
     bar.Finish();
-    WriteImage(outPath, content.pixels, force);
+    WriteImage(outPath, content.pixels, force, ImageTagsFor(parsed, content));
     std::cout << outPath << ": " << content.pixels.cols << " x " << content.pixels.rows << ", colours of "
               << (byIndex ? "style " + std::to_string(styleIndex) : stylePath) << "\n";
 

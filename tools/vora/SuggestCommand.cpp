@@ -59,6 +59,9 @@ const char* const kHelp =
     "                       whole photo either way\n"
     "  --full               render the proposals at full resolution instead\n"
     "  --strength S         how much of each look to show, 0 to 1 (default 1)\n"
+    "  --keep-profile       write the proposals in the photo's own colour profile\n"
+    "                       (default: sRGB)\n"
+    "  --strip-metadata     copy no EXIF, XMP or IPTC from the photo\n"
     "  --force              replace files that exist in the output folder\n"
     "  --max-pixels N       refuse photos above N pixels before decoding them\n"
     "                       (default 128000000)\n";
@@ -89,7 +92,7 @@ int Run(const std::vector<std::string>& args) {
                        ValueOption("--out"), ValueOption("--format"), ValueOption("--ranking"), ValueOption("--solve"),
                        ValueOption("--limit"), ValueOption("--finish"), FlagOption("--force"),
                        ValueOption("--max-pixels"), ValueOption("--preview"), FlagOption("--full"),
-                       ValueOption("--strength")},
+                       ValueOption("--strength"), FlagOption("--keep-profile"), FlagOption("--strip-metadata")},
                       args);
     parsed.ExpectPositionals(1, 1, kSynopsis);
     const std::string photoPath = parsed.positionals()[0];
@@ -214,7 +217,7 @@ int Run(const std::vector<std::string>& args) {
         cv::Mat rendered = shown.clone();
         RenderInPlace(*api, rendered, t, &bar, share * k, share * (k + 1));
         MixWithOriginal(shown, rendered, strength);
-        WriteImage(staged(proposalPaths[k]), rendered, false);
+        WriteImage(staged(proposalPaths[k]), rendered, false, ImageTagsFor(parsed, photo));
         sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),
                          "#" + std::to_string(k) + "  style " + std::to_string(t.styleIndex),
                          "cluster " + std::to_string(t.clusterIndex) +

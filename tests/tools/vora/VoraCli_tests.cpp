@@ -30,6 +30,7 @@
 #include "model/StyleDatabase.h"
 #include "support/ModelFixtures.h"
 #include "support/TestImages.h"
+#include "tools/vora/CliSupport.h"
 #include "vora/Cli.h"
 #include "vora/OutputFiles.h"
 #include "vora/TransferJson.h"
@@ -42,53 +43,11 @@ using vora::fixtures::ModelFixture;
 using vora::testimages::ImageHandle;
 using vora::testimages::SameRecord;
 using vora::testimages::SyntheticPhotoRgb;
+using namespace vora::clitest;
 
 // =============================================================================
 // Running the tool
 // =============================================================================
-
-struct RunResult {
-    int status = -1;
-    std::string out;
-    std::string err;
-};
-
-std::string Slurp(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    std::ostringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
-// Runs the tool in folder cwd without $VORA_MODEL; its output is captured
-// outside that folder so that the folder holds only what the tool wrote.
-RunResult RunVora(const std::string& cwd, const std::vector<std::string>& args) {
-    static const std::string capture = vora::fixtures::MakeTempFolder();
-    std::string command = "cd '" + cwd + "' && exec env -u VORA_MODEL '" VORA_CLI_PATH "'";
-    for (const std::string& a : args) command += " '" + a + "'";  // no test argument holds a quote
-    const int status = std::system((command + " >" + capture + "/out 2>" + capture + "/err").c_str());
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status), Slurp(capture + "/out"),
-            Slurp(capture + "/err")};
-}
-
-std::set<std::string> ListTree(const std::string& root) {
-    std::set<std::string> files;
-    for (const auto& entry : fs::recursive_directory_iterator(root))
-        files.insert(fs::relative(entry.path(), root).string());
-    return files;
-}
-
-void WriteRgb(const std::string& path, const cv::Mat& rgbOrGrey) {
-    cv::Mat bgr = rgbOrGrey.clone();
-    if (bgr.channels() > 1) cv::cvtColor(bgr, bgr, bgr.channels() == 4 ? cv::COLOR_RGBA2BGRA : cv::COLOR_RGB2BGR);
-    ASSERT_TRUE(cv::imwrite(path, bgr));
-}
-
-cv::Mat ReadRgb(const std::string& path) {
-    cv::Mat image = cv::imread(path, cv::IMREAD_UNCHANGED);
-    cv::cvtColor(image, image, image.channels() == 4 ? cv::COLOR_BGRA2RGBA : cv::COLOR_BGR2RGB);
-    return image;
-}
 
 bool SameBytes(const cv::Mat& a, const cv::Mat& b) {
     return a.size() == b.size() && a.type() == b.type() && cv::norm(a, b, cv::NORM_INF) == 0.0;
@@ -115,35 +74,6 @@ cv::Mat Mixed(const cv::Mat& original, const cv::Mat& restyled, double strength)
 
 // The dark oval of SyntheticPhotoRgb, given as the face.
 const char* const kFace = "0.3,0.5,0.25,0.55";
-
-// A work folder holding a fixture model and a test photo.
-class CliTest : public ::testing::Test {
-protected:
-    void SetUp() override { WriteRgb(m_work + "/photo.png", m_photo); }
-    void TearDown() override { vora::fixtures::RemoveTree(m_work); }
-
-    RunResult Run(const std::vector<std::string>& args) { return RunVora(m_work, args); }
-
-    // Runs a command that must be refused: its status, a single line on
-    // standard error that starts with "vora: " and contains `mentions`, and
-    // the work folder unchanged.
-    void ExpectRefused(const std::vector<std::string>& args, int status, const std::string& mentions) {
-        const std::set<std::string> before = ListTree(m_work);
-        const RunResult r = Run(args);
-        SCOPED_TRACE(testing::PrintToString(args));
-        EXPECT_EQ(r.status, status) << r.err;
-        EXPECT_EQ(r.err.rfind("vora: ", 0), 0u) << r.err;
-        EXPECT_EQ(std::count(r.err.begin(), r.err.end(), '\n'), 1) << r.err;
-        EXPECT_NE(r.err.find(mentions), std::string::npos) << r.err;
-        EXPECT_EQ(ListTree(m_work), before);
-    }
-
-    std::string m_work = vora::fixtures::MakeTempFolder();
-    cv::Mat m_photo = SyntheticPhotoRgb(120, 160);
-    ModelFixture m_model{vora::fixtures::RandomDatabase(4, 12, 7)};
-    const std::string m_modelDir = m_model.modelDir();
-    const vora::vora_api m_api{m_modelDir};
-};
 
 // =============================================================================
 // Bad input: message, exit status, nothing written

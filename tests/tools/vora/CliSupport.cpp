@@ -1,0 +1,66 @@
+#include "tools/vora/CliSupport.h"
+
+#include <sys/wait.h>
+
+#include <algorithm>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+
+#include <opencv2/imgcodecs.hpp>
+#include <opencv2/imgproc.hpp>
+
+namespace vora {
+namespace clitest {
+
+namespace fs = std::filesystem;
+
+std::string Slurp(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    std::ostringstream s;
+    s << in.rdbuf();
+    return s.str();
+}
+
+RunResult RunVora(const std::string& cwd, const std::vector<std::string>& args) {
+    static const std::string capture = fixtures::MakeTempFolder();
+    std::string command = "cd '" + cwd + "' && exec env -u VORA_MODEL '" VORA_CLI_PATH "'";
+    for (const std::string& a : args) command += " '" + a + "'";  // no test argument holds a quote
+    const int status = std::system((command + " >" + capture + "/out 2>" + capture + "/err").c_str());
+    return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status), Slurp(capture + "/out"),
+            Slurp(capture + "/err")};
+}
+
+std::set<std::string> ListTree(const std::string& root) {
+    std::set<std::string> files;
+    for (const auto& entry : fs::recursive_directory_iterator(root))
+        files.insert(fs::relative(entry.path(), root).string());
+    return files;
+}
+
+void WriteRgb(const std::string& path, const cv::Mat& rgbOrGrey) {
+    cv::Mat bgr = rgbOrGrey.clone();
+    if (bgr.channels() > 1) cv::cvtColor(bgr, bgr, bgr.channels() == 4 ? cv::COLOR_RGBA2BGRA : cv::COLOR_RGB2BGR);
+    ASSERT_TRUE(cv::imwrite(path, bgr));
+}
+
+cv::Mat ReadRgb(const std::string& path) {
+    cv::Mat image = cv::imread(path, cv::IMREAD_UNCHANGED);
+    cv::cvtColor(image, image, image.channels() == 4 ? cv::COLOR_BGRA2RGBA : cv::COLOR_BGR2RGB);
+    return image;
+}
+
+void CliTest::ExpectRefused(const std::vector<std::string>& args, int status, const std::string& mentions) {
+    const std::set<std::string> before = ListTree(m_work);
+    const RunResult r = Run(args);
+    SCOPED_TRACE(testing::PrintToString(args));
+    EXPECT_EQ(r.status, status) << r.err;
+    EXPECT_EQ(r.err.rfind("vora: ", 0), 0u) << r.err;
+    EXPECT_EQ(std::count(r.err.begin(), r.err.end(), '\n'), 1) << r.err;
+    EXPECT_NE(r.err.find(mentions), std::string::npos) << r.err;
+    EXPECT_EQ(ListTree(m_work), before);
+}
+
+}  // namespace clitest
+}  // namespace vora

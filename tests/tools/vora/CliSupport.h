@@ -1,0 +1,61 @@
+#pragma once
+
+// Running the built vora tool from tests: in a work folder of its own, on a
+// fixture model, with its exit status and both output streams captured.
+
+#include <set>
+#include <string>
+#include <vector>
+
+#include <gtest/gtest.h>
+#include <opencv2/core.hpp>
+#include <vora/vora.h>
+
+#include "support/ModelFixtures.h"
+#include "support/TestImages.h"
+
+namespace vora {
+namespace clitest {
+
+struct RunResult {
+    int status = -1;
+    std::string out;
+    std::string err;
+};
+
+std::string Slurp(const std::string& path);
+
+// Runs the tool in folder cwd without $VORA_MODEL; its output is captured
+// outside that folder so that the folder holds only what the tool wrote.
+RunResult RunVora(const std::string& cwd, const std::vector<std::string>& args);
+
+// Every path below root, relative to it.
+std::set<std::string> ListTree(const std::string& root);
+
+// Writes or reads an image file of R, G, B(, A) pixels (or grey).
+void WriteRgb(const std::string& path, const cv::Mat& rgbOrGrey);
+cv::Mat ReadRgb(const std::string& path);
+
+// A work folder holding photo.png, removed after the test, and a fixture
+// model with the facade opened on it.
+class CliTest : public ::testing::Test {
+protected:
+    void SetUp() override { WriteRgb(m_work + "/photo.png", m_photo); }
+    void TearDown() override { fixtures::RemoveTree(m_work); }
+
+    RunResult Run(const std::vector<std::string>& args) { return RunVora(m_work, args); }
+
+    // Runs a command that must be refused: its status, a single line on
+    // standard error that starts with "vora: " and contains `mentions`, and
+    // the work folder unchanged.
+    void ExpectRefused(const std::vector<std::string>& args, int status, const std::string& mentions);
+
+    std::string m_work = fixtures::MakeTempFolder();
+    cv::Mat m_photo = testimages::SyntheticPhotoRgb(120, 160);
+    fixtures::ModelFixture m_model{fixtures::RandomDatabase(4, 12, 7)};
+    const std::string m_modelDir = m_model.modelDir();
+    const vora_api m_api{m_modelDir};
+};
+
+}  // namespace clitest
+}  // namespace vora
