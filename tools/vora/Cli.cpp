@@ -7,6 +7,11 @@
 #include <cstdlib>
 #include <iostream>
 #include <limits>
+#include <mutex>
+#include <vector>
+
+#include <fcntl.h>
+#include <unistd.h>
 
 namespace vora {
 namespace cli {
@@ -146,7 +151,46 @@ std::string OneLine(const std::string& text) {
 
 void PrintError(const std::string& line) { std::cerr << "vora: " << OneLine(line) << std::endl; }
 
-void PrintNotice(const std::string& line) { std::cerr << "vora: " << OneLine(line) << std::endl; }
+namespace {
+
+std::mutex g_standardError;
+int g_muteDepth = 0;
+int g_savedStandardError = -1;
+std::vector<std::string> g_heldNotices;
+
+}  // namespace
+
+void PrintNotice(const std::string& line) {
+    const std::lock_guard<std::mutex> lock(g_standardError);
+    if (g_muteDepth > 0)
+        g_heldNotices.push_back(OneLine(line));
+    else
+        std::cerr << "vora: " << OneLine(line) << std::endl;
+}
+
+MutedStandardError::MutedStandardError() {
+    const std::lock_guard<std::mutex> lock(g_standardError);
+    if (g_muteDepth++ > 0) return;
+    std::cerr.flush();
+    std::fflush(stderr);
+    g_savedStandardError = dup(STDERR_FILENO);
+    const int null = open("/dev/null", O_WRONLY);
+    if (g_savedStandardError >= 0 && null >= 0) dup2(null, STDERR_FILENO);
+    if (null >= 0) close(null);
+}
+
+MutedStandardError::~MutedStandardError() {
+    const std::lock_guard<std::mutex> lock(g_standardError);
+    if (--g_muteDepth > 0) return;
+    std::fflush(stderr);
+    if (g_savedStandardError >= 0) {
+        dup2(g_savedStandardError, STDERR_FILENO);
+        close(g_savedStandardError);
+        g_savedStandardError = -1;
+    }
+    for (const std::string& notice : g_heldNotices) std::cerr << "vora: " << notice << std::endl;
+    g_heldNotices.clear();
+}
 
 }  // namespace cli
 }  // namespace vora

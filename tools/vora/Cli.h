@@ -102,8 +102,22 @@ struct RegisterCommand {
 
 // Prints "vora: <line>" on standard error.
 void PrintError(const std::string& line);
-// Prints "vora: <line>" on standard error, as a remark that does not stop the command.
+// Prints "vora: <line>" on standard error, as a remark that does not stop the
+// command. Safe from any thread; while standard error is muted, the notice is
+// held and printed when it is restored.
 void PrintNotice(const std::string& line);
+
+// Sends standard error to /dev/null while it lives, for libraries that print
+// their own warnings (the image decoders); our notices are held meanwhile.
+// Nests, and may be used by several threads at once: the stream is restored
+// when the last one ends.
+class MutedStandardError {
+public:
+    MutedStandardError();
+    ~MutedStandardError();
+    MutedStandardError(const MutedStandardError&) = delete;
+    MutedStandardError& operator=(const MutedStandardError&) = delete;
+};
 
 }  // namespace cli
 }  // namespace vora

@@ -142,6 +142,10 @@ const std::string& SrgbProfileBytes() {
         cmsSaveProfileToMem(srgb.get(), nullptr, &size);
         std::string data(size, '\0');
         cmsSaveProfileToMem(srgb.get(), data.data(), &size);
+        // Little CMS stamps the profile with the time it was made; a fixed date
+        // (2026-01-01, header bytes 24 to 35) keeps outputs reproducible.
+        static const char kDate[12] = {0x07, static_cast<char>(0xea), 0, 1, 0, 1, 0, 0, 0, 0, 0, 0};
+        if (data.size() >= 36) data.replace(24, 12, kDate, 12);
         return data;
     }();
     return bytes;

@@ -9,9 +9,6 @@
 #include <iterator>
 #include <vector>
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <opencv2/imgcodecs.hpp>
 #include <opencv2/imgproc.hpp>
 
@@ -28,32 +25,6 @@ std::string LowerExtension(const std::string& path) {
     std::transform(ext.begin(), ext.end(), ext.begin(), [](unsigned char c) { return std::tolower(c); });
     return ext;
 }
-
-// The image decoders' libraries print their own warnings (libpng: "known
-// incorrect sRGB profile") straight to standard error; we report failures
-// ourselves, in one line, so their chatter is muted while decoding.
-class MutedStandardError {
-public:
-    MutedStandardError() {
-        std::fflush(stderr);
-        m_saved = dup(STDERR_FILENO);
-        const int null = open("/dev/null", O_WRONLY);
-        if (m_saved >= 0 && null >= 0) dup2(null, STDERR_FILENO);
-        if (null >= 0) close(null);
-    }
-    ~MutedStandardError() {
-        std::fflush(stderr);
-        if (m_saved >= 0) {
-            dup2(m_saved, STDERR_FILENO);
-            close(m_saved);
-        }
-    }
-    MutedStandardError(const MutedStandardError&) = delete;
-    MutedStandardError& operator=(const MutedStandardError&) = delete;
-
-private:
-    int m_saved = -1;
-};
 
 bool IsJpeg(const std::vector<uchar>& bytes) {
     return bytes.size() >= 3 && bytes[0] == 0xFF && bytes[1] == 0xD8 && bytes[2] == 0xFF;
@@ -93,6 +64,8 @@ Photo ReadPhoto(const std::string& path, uint64_t maxPixels) {
     const int flags = IsJpeg(bytes) ? (cv::IMREAD_ANYDEPTH | cv::IMREAD_ANYCOLOR) : cv::IMREAD_UNCHANGED;
     cv::Mat decoded;
     try {
+        // The decoders' libraries print their own warnings (libpng: "known
+        // incorrect sRGB profile"); failures are reported in our words.
         MutedStandardError muted;
         decoded = cv::imdecode(bytes, flags);
     } catch (const cv::Exception&) {

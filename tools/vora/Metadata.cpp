@@ -3,6 +3,7 @@
 #include <cstring>
 #include <stdexcept>
 #include <exception>
+#include <mutex>
 
 // exiv2 0.27's interface still hands out std::auto_ptr.
 #pragma GCC diagnostic push
@@ -28,12 +29,20 @@ struct PhotoMetadata {
 
 namespace {
 
-// exiv2's global state: its XMP toolkit must be set up once before threads
-// use it, and its warnings are muted (failures are reported in our words).
+void LockXmpToolkit(void* mutex, bool lock) {
+    if (lock)
+        static_cast<std::mutex*>(mutex)->lock();
+    else
+        static_cast<std::mutex*>(mutex)->unlock();
+}
+
+// exiv2's global state: its XMP toolkit is set up once, behind a lock, and
+// its warnings are muted (failures are reported in our words).
 void InitialiseOnce() {
+    static std::mutex xmpToolkit;  // not thread-safe on its own
     static const bool done = [] {
         Exiv2::LogMsg::setLevel(Exiv2::LogMsg::mute);
-        return Exiv2::XmpParser::initialize();
+        return Exiv2::XmpParser::initialize(LockXmpToolkit, &xmpToolkit);
     }();
     (void)done;
 }

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <cerrno>
 #include <csignal>
+#include <mutex>
 #include <cstring>
 #include <filesystem>
 #include <system_error>
@@ -163,6 +164,9 @@ void CheckOutputPath(const std::string& output, const std::vector<std::string>& 
 }
 
 void WriteFileAtomically(const std::string& path, const std::string& bytes, bool replace) {
+    // One file at a time: the interrupt handler knows a single pending name.
+    static std::mutex oneAtATime;
+    const std::lock_guard<std::mutex> lock(oneAtATime);
     InstallInterruptCleanup();
     const fs::path target(path);
     fs::path folder = target.parent_path();
