@@ -45,8 +45,14 @@ void RunTransform(void* transform, const cv::Mat& in, cv::Mat& out) {
     });
 }
 
-// Converts RGB(A) pixels with an RGB-to-RGB transform; alpha is put back as it was.
-cv::Mat ConvertRgb(const cv::Mat& pixels, void* transform) {
+// Converts pixels with a transform into RGB(A) of the same layout; alpha is
+// put back as it was. With `inPlace` (input and output formats the same size
+// per pixel: Little CMS reads each pixel before writing it) no copy is made.
+cv::Mat ConvertRgb(cv::Mat& pixels, void* transform, bool inPlace) {
+    if (inPlace) {
+        RunTransform(transform, pixels, pixels);
+        return pixels;
+    }
     cv::Mat out(pixels.size(), pixels.type());
     RunTransform(transform, pixels, out);
     if (pixels.channels() == 4) {
@@ -116,14 +122,14 @@ void ConvertToSrgb(cv::Mat& pixels, const ColourProfile& profile, bool grey) {
         const Transform transform = MakeTransform(opened.get(), TYPE_RGB_8, srgb.get(), TYPE_RGB_8);
         const Transform withAlpha = MakeTransform(opened.get(), TYPE_RGBA_8, srgb.get(), TYPE_RGBA_8);
         if (!transform || !withAlpha) throw Failure(profile.name + ": cannot convert colours to sRGB");
-        pixels = ConvertRgb(pixels, pixels.channels() == 4 ? withAlpha.get() : transform.get());
+        pixels = ConvertRgb(pixels, pixels.channels() == 4 ? withAlpha.get() : transform.get(), true);
         return;
     }
     const Transform transform =
         MakeTransform(opened.get(), GreyFormat(pixels.channels()), srgb.get(),
                       pixels.channels() == 4 ? TYPE_RGBA_8 : TYPE_RGB_8);
     if (!transform) throw Failure(profile.name + ": cannot convert colours to sRGB");
-    pixels = ConvertRgb(pixels, transform.get());
+    pixels = ConvertRgb(pixels, transform.get(), false);
 }
 
 void ConvertFromSrgb(cv::Mat& pixels, const ColourProfile& profile) {
@@ -132,7 +138,7 @@ void ConvertFromSrgb(cv::Mat& pixels, const ColourProfile& profile) {
     const cmsUInt32Number format = pixels.channels() == 4 ? TYPE_RGBA_8 : TYPE_RGB_8;
     const Transform transform = MakeTransform(srgb.get(), format, opened.get(), format);
     if (!transform) throw Failure(profile.name + ": cannot convert colours from sRGB into it");
-    pixels = ConvertRgb(pixels, transform.get());
+    pixels = ConvertRgb(pixels, transform.get(), true);
 }
 
 const std::string& SrgbProfileBytes() {
