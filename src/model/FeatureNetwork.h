@@ -9,15 +9,12 @@
 
 #include "model/InputTransform.h"
 #include "model/MeanBlob.h"
+#include "model/ModelFileNames.h"
 #include "model/PreparedDefinition.h"
 
 #include "KitApi.h"
 
 namespace vora {
-
-constexpr const char* kNetworkFolder = "net/";
-constexpr const char* kNetworkDefinitionName = "deploy2.prototxt";
-constexpr const char* kNetworkWeightsName = "caffe_reduce_512_model";
 
 // Parses the definition, drops the layers a network built for testing leaves
 // out (include/exclude rules against phase TEST, level 0, no stages), replaces

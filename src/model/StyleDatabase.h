@@ -3,17 +3,13 @@
 #include <string>
 
 #include "KitApi.h"
+#include "model/ModelFileNames.h"
 
 namespace vora {
 
-class Engine;
+struct Engine;
 
 enum class ReadResult { Ok = 0, CannotOpen = -4, SizeMismatch = -5 };
-
-constexpr const char* kClusterFileName = "semantic_cluster_1000.dat";
-constexpr const char* kStyleFileName = "styledb_style_1500.dat";
-constexpr const char* kScoresFileName = "semantic_style_scores_1000_1500_1.dat";
-constexpr const char* kDistanceFileName = "styledb_fdist_1500.dat";
 
 // Data files are joined as modelDir + "/" + name (so "./model/" gives
 // "./model//name", which file systems accept).

@@ -10,6 +10,7 @@
 #include <sstream>
 #include <stdexcept>
 
+#include "model/ModelFileNames.h"
 #include "modelkit/ModelBuilder.h"
 #include "modelkit/TfjsConverter.h"
 #include "vora/Cli.h"
@@ -60,11 +61,6 @@ const char* const kHelp =
     "  --force         replace a model that is already in --out\n";
 
 const char* const kFetchHint = "bash scripts/fetch-network.sh";
-
-// The six files a model consists of, relative to its directory.
-const char* const kModelFiles[] = {"semantic_cluster_1000.dat", "styledb_style_1500.dat",
-                                   "semantic_style_scores_1000_1500_1.dat", "styledb_fdist_1500.dat",
-                                   "net/deploy2.prototxt", "net/caffe_reduce_512_model"};
 
 void RequireFolder(const std::string& dir, const std::string& option) {
     std::error_code ec;
@@ -182,7 +178,7 @@ int Run(const std::vector<std::string>& args) {
     if (fs::exists(out, ec) && !fs::is_directory(out, ec))
         throw UsageError(out.string() + ": exists and is not a folder (--out names the model directory)");
     if (fs::is_directory(out, ec) && !force)
-        for (const char* name : kModelFiles)
+        for (const char* name : kModelFileNames)
             if (fs::exists(out / name, ec))
                 throw UsageError(out.string() + ": already holds a model (" + name + "); use --force to replace it");
     RequireFolder(options.stylesDir, "--styles");

@@ -7,18 +7,13 @@
 #include <iterator>
 #include <limits>
 
+#include "model/ModelFileNames.h"
+
 namespace vora {
 namespace cli {
 namespace {
 
 namespace fs = std::filesystem;
-
-constexpr const char* kClusterFile = "semantic_cluster_1000.dat";
-constexpr const char* kStyleFile = "styledb_style_1500.dat";
-constexpr const char* kScoresFile = "semantic_style_scores_1000_1500_1.dat";
-constexpr const char* kDistanceFile = "styledb_fdist_1500.dat";
-constexpr const char* kDefinitionFile = "net/deploy2.prototxt";
-constexpr const char* kWeightsFile = "net/caffe_reduce_512_model";
 
 constexpr uint64_t kCentreBytes = 512 * 4;
 constexpr uint64_t kStyleRecordBytes = 152;  // 38 floats
@@ -245,12 +240,12 @@ private:
 ModelExamination ExamineModelFiles(const std::string& dir) {
     ModelExamination m;
     m.dir = dir;
-    m.clusters = Probe(dir, kClusterFile);
-    m.styles = Probe(dir, kStyleFile);
-    m.scores = Probe(dir, kScoresFile);
-    m.distances = Probe(dir, kDistanceFile);
-    m.definition = Probe(dir, kDefinitionFile);
-    m.weights = Probe(dir, kWeightsFile);
+    m.clusters = Probe(dir, kClusterFileName);
+    m.styles = Probe(dir, kStyleFileName);
+    m.scores = Probe(dir, kScoresFileName);
+    m.distances = Probe(dir, kDistanceFileName);
+    m.definition = Probe(dir, kNetworkDefinitionPath);
+    m.weights = Probe(dir, kNetworkWeightsPath);
     std::error_code ec;
     if (!fs::is_directory(dir, ec)) {
         m.problems.push_back(fs::exists(dir, ec) ? "it is not a directory" : "no such directory");
