@@ -203,7 +203,7 @@ void BuildModel(const BuildModelOptions& options) {
     cv::Mat contentPooled(0, pooledSize, CV_32F);
     for (int s = 0; s < styleCount; ++s) {
         Report(options, 0.8 * s / photoCount, "reading " + fs::path(stylePaths[s]).filename().string());
-        const cv::Mat photo = ReadPhoto(stylePaths[s]);
+        const cv::Mat photo = ReadPhotoBgr(stylePaths[s]);
         styles[s] = StyleStats(photo);
         stylePooled.push_back(PooledRow(*pooledNet, photo, pooledSize));
         if (contentPaths.empty()) {
@@ -213,7 +213,7 @@ void BuildModel(const BuildModelOptions& options) {
     }
     for (size_t c = 0; c < contentPaths.size(); ++c) {
         Report(options, 0.8 * (styleCount + c) / photoCount, "reading " + fs::path(contentPaths[c]).filename().string());
-        contentPooled.push_back(PooledRow(*pooledNet, ReadPhoto(contentPaths[c]), pooledSize));
+        contentPooled.push_back(PooledRow(*pooledNet, ReadPhotoBgr(contentPaths[c]), pooledSize));
     }
     pooledNet.reset();
 

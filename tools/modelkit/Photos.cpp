@@ -39,7 +39,7 @@ std::vector<std::string> ListPhotos(const std::string& dir) {
     return paths;
 }
 
-cv::Mat ReadPhoto(const std::string& path) {
+cv::Mat ReadPhotoBgr(const std::string& path) {
     cv::Mat image;
     try {
         // ANYCOLOR keeps greyscale as one channel and drops alpha; ANYDEPTH

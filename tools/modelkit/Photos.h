@@ -21,7 +21,7 @@ std::vector<std::string> ListPhotos(const std::string& dir);
 // alpha dropped, 16-bit samples reduced to 8 bits (divided by 257, rounded).
 // The orientation recorded in the file is applied, as a viewer shows it.
 // Throws std::runtime_error naming the file when it cannot be read.
-cv::Mat ReadPhoto(const std::string& path);
+cv::Mat ReadPhotoBgr(const std::string& path);
 
 // The rule that picks photographs out of a data package's images: 8-bit,
 // opaque (three channels, or four with every alpha sample at 255), and at

@@ -59,7 +59,7 @@ RetrievalResult MeasureRetrieval(const std::string& modelDir, const std::vector<
     std::vector<Copy> copies;
     for (size_t p = 0; p < photoPaths.size(); ++p) {
         if (progress) progress(double(p) / photoPaths.size(), fs::path(photoPaths[p]).filename().string());
-        const cv::Mat photo = ReadPhoto(photoPaths[p]);
+        const cv::Mat photo = ReadPhotoBgr(photoPaths[p]);
         copies.push_back({int(p), -1, PhotoFeature(*network, photo)});
         for (size_t a = 0; a < alterations.size(); ++a)
             copies.push_back({int(p), int(a), PhotoFeature(*network, Alter(photo, alterations[a]))});

@@ -13,7 +13,7 @@ namespace vora {
 namespace modelkit {
 
 // Normalised, y downward, as `vora faces` prints it and `--faces` takes it.
-struct FaceBox {
+struct FaceRect {
     double left = 0, right = 0, top = 0, bottom = 0;
 };
 
@@ -24,12 +24,12 @@ struct SkinColour {
 };
 
 // "L,R,T,B" with 0 <= L < R <= 1 and 0 <= T < B <= 1.
-bool ParseFaceBox(const std::string& text, FaceBox& box);
+bool ParseFaceRect(const std::string& text, FaceRect& box);
 
 // Median a* and b* (each on its own) of the box's pixels; the box covers at
 // least one pixel. Empty images give false.
-bool MeasureSkin(const cv::Mat& bgr, const FaceBox& box, SkinColour& colour);
-bool MeasureSkin(const std::string& path, const FaceBox& box, SkinColour& colour);
+bool MeasureSkin(const cv::Mat& bgr, const FaceRect& box, SkinColour& colour);
+bool MeasureSkin(const std::string& path, const FaceRect& box, SkinColour& colour);
 
 // The hue of `to` minus that of `from`, in (-180, 180].
 double HueTurn(const SkinColour& from, const SkinColour& to);

@@ -29,8 +29,8 @@ int main(int argc, char** argv) {
             images.push_back(arg);
         }
     }
-    FaceBox box;
-    if (!ParseFaceBox(argv[1], box)) {
+    FaceRect box;
+    if (!ParseFaceRect(argv[1], box)) {
         std::fprintf(stderr, "vora-skin-hue: '%s' is not a face box L,R,T,B with 0 <= L < R <= 1, 0 <= T < B <= 1\n", argv[1]);
         return 2;
     }

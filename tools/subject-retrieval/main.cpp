@@ -85,7 +85,7 @@ int main(int argc, char** argv) {
             if (!known) throw std::runtime_error("no photo named " + neighboursOf + " in " + evalDir);
         }
         std::vector<cv::Mat> images;
-        for (const LabelledPhoto& photo : photos) images.push_back(ReadPhoto(photo.path));
+        for (const LabelledPhoto& photo : photos) images.push_back(ReadPhotoBgr(photo.path));
 
         for (const std::string& modelDir : modelDirs) {
             const auto start = Clock::now();

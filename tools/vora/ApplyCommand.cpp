@@ -78,11 +78,11 @@ std::vector<BatchItem> PlanBatch(const std::vector<std::string>& photos, const s
 }
 
 // Reads, renders and writes one photo; returns its size. Throws what
-// ReadPhoto and WriteImage throw.
+// ReadPhotoRgb and WriteImage throw.
 cv::Size RenderOne(const vora_api& api, const TRANSFER& transfer, const TransferDocument& document, double strength,
                const ParsedArgs& parsed, const std::string& photoPath, const std::string& outPath, bool force,
                ProgressBar* bar) {
-    Photo photo = ReadPhoto(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
+    Photo photo = ReadPhotoRgb(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
 
     // Face corrections sit at normalised positions: on a photo of other
     // proportions they land on other parts of the picture.

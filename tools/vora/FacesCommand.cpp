@@ -27,7 +27,7 @@ int Run(const std::vector<std::string>& args) {
     parsed.ExpectPositionals(1, 1, "faces PHOTO [--detector hog|haar]");
     FaceDetector detector = DefaultFaceDetector();
     if (auto name = parsed.Value("--detector")) detector = ParseFaceDetector(*name);
-    const Photo photo = ReadPhoto(parsed.positionals()[0], MaxPixelsOption(parsed.Value("--max-pixels")));
+    const Photo photo = ReadPhotoRgb(parsed.positionals()[0], MaxPixelsOption(parsed.Value("--max-pixels")));
     const std::vector<DetectedFace> faces = DetectFaces(PackedRgb(photo), detector);
     for (const DetectedFace& face : faces) std::cout << FormatFaceBox(face.box) << "  " << face.score << "\n";
     std::cerr << faces.size() << (faces.size() == 1 ? " face" : " faces") << " found by "

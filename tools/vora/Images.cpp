@@ -37,7 +37,7 @@ uint64_t MaxPixelsOption(const std::optional<std::string>& value) {
     return static_cast<uint64_t>(ParseInteger(*value, "--max-pixels", 1, 1LL << 40));
 }
 
-Photo ReadPhoto(const std::string& path, uint64_t maxPixels) {
+Photo ReadPhotoRgb(const std::string& path, uint64_t maxPixels) {
     std::error_code ec;
     if (!std::filesystem::exists(path, ec)) throw Failure(path, "no such file");
     if (std::filesystem::is_directory(path, ec)) throw Failure(path, "is a directory, not an image");

@@ -42,7 +42,7 @@ constexpr uint64_t kDefaultMaxPixels = 128000000;
 // pixels are taken as sRGB). The size is read from the file's header
 // first: an image above maxPixels, a format whose header gives no size, and a
 // JPEG file cut short (no end marker) are refused without decoding.
-Photo ReadPhoto(const std::string& path, uint64_t maxPixels = kDefaultMaxPixels);
+Photo ReadPhotoRgb(const std::string& path, uint64_t maxPixels = kDefaultMaxPixels);
 
 // The value of --max-pixels when given, else kDefaultMaxPixels.
 uint64_t MaxPixelsOption(const std::optional<std::string>& value);

@@ -82,7 +82,7 @@ int Run(const std::vector<std::string>& args) {
     }
 
     const uint64_t maxPixels = MaxPixelsOption(parsed.Value("--max-pixels"));
-    Photo content = ReadPhoto(contentPath, maxPixels);
+    Photo content = ReadPhotoRgb(contentPath, maxPixels);
     cv::Mat contentRgb = PackedRgb(content);  // compute only reads it
     const auto api = OpenExaminedModel(modelDir);
     ImageHandle contentImage = WrapWholeImage(contentRgb);
@@ -92,7 +92,7 @@ int Run(const std::vector<std::string>& args) {
         CheckStatus(api->compute_transfer(contentImage.get(), static_cast<int>(styleIndex), transfer, params),
                     contentPath);
     } else {
-        Photo style = ReadPhoto(stylePath, maxPixels);
+        Photo style = ReadPhotoRgb(stylePath, maxPixels);
         cv::Mat styleRgb = PackedRgb(style);
         ImageHandle styleImage = WrapWholeImage(styleRgb);
         CheckStatus(api->compute_transfer(contentImage.get(), styleImage.get(), transfer, params), contentPath);

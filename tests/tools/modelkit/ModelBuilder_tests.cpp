@@ -144,7 +144,7 @@ TEST(ModelBuilder, NetworkLoadsAndEachStyleScoresBestInItsNearestCluster) {
     const std::vector<std::string> photos = ListPhotos(built.styles.path.string());
     for (int s = 0; s < engine.styleCount; ++s) {
         cv::Mat canvas;
-        ASSERT_TRUE(PrepareNetworkImage(ReadPhoto(photos[s]), canvas, kNetworkImageSize, kNetworkInputSize));
+        ASSERT_TRUE(PrepareNetworkImage(ReadPhotoBgr(photos[s]), canvas, kNetworkImageSize, kNetworkInputSize));
         const std::vector<float> feature = engine.network->Forward(canvas);
         ASSERT_EQ(feature.size(), 512u);
         std::vector<double> distances;

@@ -43,7 +43,7 @@ std::vector<std::pair<std::string, cv::Mat>> Inputs() {
     std::vector<std::pair<std::string, cv::Mat>> inputs;
     for (const char* name : {"grace_hopper.jpg", "astronaut.png"}) {
         const fs::path photo = kSource / ".cache/photos/content" / name;
-        if (fs::exists(photo)) inputs.emplace_back(fs::path(name).stem().string(), vora::modelkit::ReadPhoto(photo.string()));
+        if (fs::exists(photo)) inputs.emplace_back(fs::path(name).stem().string(), vora::modelkit::ReadPhotoBgr(photo.string()));
     }
     inputs.emplace_back("scene", kit_testing::Scene(7, 300, 400));
     return inputs;

@@ -7,7 +7,7 @@ using namespace vora::modelkit;
 // sRGB red is L* 53.24, a* 80.09, b* 67.20 (D65): hue 40.0 degrees.
 TEST(SkinHue, MedianOfTheBoxIgnoresAMinorityAndTheOutside) {
     cv::Mat photo(100, 200, CV_8UC3, cv::Scalar(255, 0, 0));  // blue outside the box
-    const FaceBox box{0.25, 0.75, 0.5, 1.0};                  // columns 50..149, rows 50..99
+    const FaceRect box{0.25, 0.75, 0.5, 1.0};                  // columns 50..149, rows 50..99
     photo(cv::Rect(50, 50, 100, 50)).setTo(cv::Scalar(0, 0, 255));
     photo(cv::Rect(50, 50, 100, 10)).setTo(cv::Scalar(0, 255, 0));  // a fifth of the box: hair
     SkinColour red;
@@ -24,9 +24,9 @@ TEST(SkinHue, TurnsWrapAroundAndBoxesAreChecked) {
     EXPECT_NEAR(HueTurn(at350, at10), 20.0, 1e-9);
     EXPECT_NEAR(HueTurn(at10, at350), -20.0, 1e-9);
 
-    FaceBox box;
-    EXPECT_TRUE(ParseFaceBox("0.1,0.4,0.2,0.6", box));
+    FaceRect box;
+    EXPECT_TRUE(ParseFaceRect("0.1,0.4,0.2,0.6", box));
     EXPECT_DOUBLE_EQ(box.bottom, 0.6);
     for (const char* bad : {"0.4,0.1,0.2,0.6", "0.1,0.4,0.2", "0.1,0.4,0.2,1.5", "0.1,0.4,0.2,0.6x"})
-        EXPECT_FALSE(ParseFaceBox(bad, box)) << bad;
+        EXPECT_FALSE(ParseFaceRect(bad, box)) << bad;
 }
