@@ -6,7 +6,7 @@
 
 namespace vora {
 
-class Engine;
+struct Engine;
 
 // The four compute operations of the facade. Input outside the contract is
 // refused with a failure status before any work, and nothing is written.

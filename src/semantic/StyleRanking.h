@@ -9,7 +9,7 @@
 
 namespace vora {
 
-class Engine;
+struct Engine;
 
 // Fills order (sized by the caller to the cluster count) with cluster indices
 // from nearest to farthest. Returns 0.
