@@ -66,6 +66,18 @@ const char* const kHelp =
     "  --max-pixels N       refuse photos above N pixels before decoding them\n"
     "                       (default 128000000)\n";
 
+// STEM-K.EXT with K a number and EXT an image format we write: a proposal.
+bool IsProposalName(const std::string& name, const std::string& stem) {
+    if (name.size() <= stem.size() + 1 || name.compare(0, stem.size() + 1, stem + "-") != 0) return false;
+    const size_t dot = name.rfind('.');
+    if (dot == std::string::npos || dot <= stem.size() + 1) return false;
+    for (size_t i = stem.size() + 1; i < dot; ++i)
+        if (!std::isdigit(static_cast<unsigned char>(name[i]))) return false;
+    std::string ext = name.substr(dot + 1);
+    std::transform(ext.begin(), ext.end(), ext.begin(), [](unsigned char c) { return std::tolower(c); });
+    return ext == "jpg" || ext == "jpeg" || ext == "png" || ext == "tif" || ext == "tiff" || ext == "webp";
+}
+
 std::string Lower(std::string s) {
     std::transform(s.begin(), s.end(), s.begin(), [](unsigned char c) { return std::tolower(c); });
     return s;
@@ -132,6 +144,17 @@ int Run(const std::vector<std::string>& args) {
     const std::string sheetPath = (outDir / "contact-sheet.png").string();
     const std::string jsonPath = (outDir / "transfers.json").string();
     if (fs::is_directory(outDir, ec)) {
+        // Proposals of an earlier run in another format or number would sit
+        // beside the new set and no longer match its transfers.json.
+        if (!force) {
+            for (const auto& entry : fs::directory_iterator(outDir, ec)) {
+                const std::string name = entry.path().filename().string();
+                if (IsProposalName(name, stem))
+                    throw UsageError((outDir / name).string() +
+                                     ": a proposal of an earlier run is in the output folder; refusing to mix the "
+                                     "sets (use --force, or another --out)");
+            }
+        }
         for (const std::string& path : proposalPaths) CheckOutputPath(path, {photoPath}, force);
         CheckOutputPath(sheetPath, {photoPath}, force);
         CheckOutputPath(jsonPath, {photoPath}, force);
@@ -150,7 +173,7 @@ int Run(const std::vector<std::string>& args) {
                          std::to_string(model.stylesPerCluster()) +
                          " styles this model keeps per scene; proposals would repeat");
 
-    Photo photo = ReadPhoto(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
+    Photo photo = ReadPhotoRgb(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
     cv::Mat rgb = PackedRgb(photo);  // compute reads packed R, G, B only
 
     TransferDocument document;

@@ -92,6 +92,9 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
     std::vector<uchar> jpeg;
     ASSERT_TRUE(cv::imencode(".jpg", cv::Mat(64, 64, CV_8UC3, cv::Scalar(10, 200, 30)), jpeg));
     vora::fixtures::WriteBytes(m_work + "/half.jpg", std::string(jpeg.begin(), jpeg.begin() + jpeg.size() / 2));
+    // A folder left by an earlier run of five proposals, its contact sheet deleted.
+    std::filesystem::create_directory(m_work + "/old");
+    vora::fixtures::WriteBytes(m_work + "/old/photo-4.jpg", "an earlier proposal");
     using Case = std::tuple<std::vector<std::string>, int, std::string>;  // arguments, status, mentions
     const std::vector<Case> cases = {
         // Usage errors exit 2.
@@ -108,6 +111,7 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
         {{"suggest", "photo.png", "--model", m, "--solve", "0"}, 2, "--solve"},
         {{"suggest", "photo.png", "--model", m, "--limit", "inf"}, 2, "--limit"},
         {{"suggest", "photo.png", "--model", m, "--finish", "3"}, 2, "--finish"},
+        {{"suggest", "photo.png", "--model", m, "-n", "2", "--out", "old"}, 2, "old/photo-4.jpg: a proposal of an earlier run"},
         {{"suggest", "photo.png", "--model", m, "--faces", "0.6,0.4,0.1,0.5"}, 2, "0.6,0.4,0.1,0.5"},
         {{"suggest", "photo.png", "--model", m, "--faces", "0.1,0.4,0.5,1.5"}, 2, "--faces"},
         {{"suggest", "photo.png", "--model", m, "--faces", "0.1,0.4"}, 2, "--faces"},
@@ -335,7 +339,8 @@ size_t Entries(const std::string& folder) {
 // A file that appears at the output path after the check is never replaced
 // without --force (the rename used to replace it and exit 0); with it, it is.
 TEST(OutputFiles, TheFinalStepReplacesOnlyWhenAllowed) {
-    const std::string folder = vora::fixtures::MakeTempFolder(), path = folder + "/out.txt";
+    const vora::fixtures::TempFolder temp;
+    const std::string folder = temp.path(), path = folder + "/out.txt";
     vora::fixtures::WriteBytes(path, "the user's");
     EXPECT_THAT([&] { vora::cli::WriteFileAtomically(path, "ours", false); },
                 testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("already exists")));
@@ -343,14 +348,14 @@ TEST(OutputFiles, TheFinalStepReplacesOnlyWhenAllowed) {
     EXPECT_EQ(Entries(folder), 1u);  // no temporary left
     vora::cli::WriteFileAtomically(path, "ours", true);
     EXPECT_EQ(Contents(path), "ours");
-    vora::fixtures::RemoveTree(folder);
 }
 
 // A set appears whole or not at all: in a new folder by one rename, in an
 // existing one file by file, taken back when one is in the way; abandoned, it
 // leaves nothing.
 TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
-    const std::string root = vora::fixtures::MakeTempFolder(), out = root + "/set";
+    const vora::fixtures::TempFolder temp;
+    const std::string root = temp.path(), out = root + "/set";
     {
         vora::cli::StagingFolder abandoned(out);
         vora::cli::WriteFileAtomically(abandoned.PathFor("a.txt"), "a", false);
@@ -384,7 +389,6 @@ TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
         staging.Commit(false);
     }
     EXPECT_EQ(Contents(root + "/new/deeper/set/c.txt"), "c");
-    vora::fixtures::RemoveTree(root);
 }
 
 // =============================================================================
