@@ -238,16 +238,26 @@ public:
     IImage& operator=(const IImage&) = default;
     /// Deletes the object at once, whatever the count; pixels are untouched.
     virtual void Destroy() = 0;
+    /// The first byte of the first pixel (the host's memory; not owned).
     virtual uint8_t* GetData() = 0;
+    /// The same pointer, for reading.
     virtual const uint8_t* GetConstData() const = 0;
+    /// Pixels per row of this image (of the tile, for a tile).
     virtual size_t GetWidth() const = 0;
+    /// Rows of this image (of the tile, for a tile).
     virtual size_t GetHeight() const = 0;
+    /// Channels the host declared; the library reads and writes the first three.
     virtual size_t GetChannels() const = 0;
+    /// Bytes from one row to the next.
     virtual size_t GetRowStride() const = 0;
+    /// Bytes from one pixel to the next (at least 3 for the library to use it).
     virtual size_t GetPixelStride() const = 0;
     /// Entry index (0..3) of the host's layout values; not range-checked.
     virtual size_t GetLayoutValue(int index) const = 0;
+    /// Where this image sits in the full-resolution image, in pixels ((0, 0)
+    /// for a whole image).
     virtual CTopLeftCoordinate GetTopLeft() const = 0;
+    /// Size of the full-resolution image this one is (a tile of).
     virtual CFullResImageSize GetFullResSize() const = 0;
 
 protected:

@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <cmath>
 #include <cstdint>
 #include <numeric>
 #include <sstream>
@@ -59,6 +60,33 @@ TEST(ImageObjects, GeometryStridesReferenceCountsAndReleasing) {
         end(image);
     }
     EXPECT_TRUE(packed == packedBefore && full == fullBefore);
+}
+
+// Area counts pixels of an inclusive rectangle and does not look at
+// emptiness; Empty is true only for strictly inverted sides (NaN never).
+TEST(ImageObjects, DoubleRectAreaAndEmptinessAtTheirEdges) {
+    struct Case {
+        CDoubleRect rect;
+        double area;
+        bool empty;
+    };
+    const Case cases[] = {
+        {CDoubleRect(), 1.0, false},                     // one pixel at the origin
+        {CDoubleRect(2, 2, 3, 3), 1.0, false},           // a point
+        {CDoubleRect(0, 9, 0, 4), 50.0, false},          // 10 x 5
+        {CDoubleRect(3, 2, 0, 4), 0.0, true},            // inverted by one: no pixels
+        {CDoubleRect(5, 2, 5, 2), 4.0, true},            // both inverted: positive product, still empty
+        {CDoubleRect(0, 9, 4, 0), -30.0, true},          // one inverted: negative
+        {CDoubleRect(0.5, 1.0, 0, 0), 1.5, false},       // fractional sides
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(testing::Message() << c.rect.left << " " << c.rect.right << " " << c.rect.top << " " << c.rect.bottom);
+        EXPECT_EQ(c.rect.Area(), c.area);
+        EXPECT_EQ(c.rect.Empty(), c.empty);
+    }
+    const CDoubleRect nan(std::nan(""), 1, 0, 1);
+    EXPECT_FALSE(nan.Empty());
+    EXPECT_TRUE(std::isnan(nan.Area()));
 }
 
 }  // namespace

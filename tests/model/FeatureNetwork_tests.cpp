@@ -35,8 +35,8 @@ bool SameFloats(const cv::Mat& a, const float* b, size_t count) {
 
 // A network folder that lives as long as the test.
 struct TempNetwork {
-    std::string folder = fixtures::MakeTempFolder() + "/";
-    ~TempNetwork() { fixtures::RemoveTree(folder); }
+    fixtures::TempFolder temp;
+    std::string folder = temp.path() + "/";
     std::unique_ptr<FeatureNetwork> Load() const {
         return FeatureNetwork::Load(folder + kNetworkDefinitionName, folder + kNetworkWeightsName);
     }
@@ -160,6 +160,16 @@ TEST(FeatureNetwork, ReadsMeanBlobsInTheLegacyLayout) {
     fixtures::WriteBytes(files.folder + "short", legacy.substr(0, 8 + 5));
     EXPECT_THROW(ReadMeanBlob(files.folder + "short", 2, 3, 4), cv::Exception);
     EXPECT_THROW(ReadMeanBlob(files.folder + "absent", 2, 3, 4), cv::Exception);
+    // Cut in the middle of the last value, unpacked and packed: refused, not read as 0.
+    fixtures::WriteBytes(files.folder + "cut", legacy.substr(0, legacy.size() - 2));
+    EXPECT_THROW(ReadMeanBlob(files.folder + "cut", 2, 3, 4), cv::Exception);
+    std::string packed = {8, 1, 16, 2, 24, 3, 32, 4, '\x2a', static_cast<char>(4 * values.size())};
+    packed += std::string(reinterpret_cast<const char*>(values.data()), 4 * values.size());
+    fixtures::WriteBytes(files.folder + "packed", packed);
+    EXPECT_TRUE(SameFloats(ReadMeanBlob(files.folder + "packed", 2, 3, 4), values.data(), values.size()));
+    packed[9] = static_cast<char>(4 * values.size() - 2);  // the length itself cuts the last value
+    fixtures::WriteBytes(files.folder + "packed-cut", packed.substr(0, packed.size() - 2));
+    EXPECT_THROW(ReadMeanBlob(files.folder + "packed-cut", 2, 3, 4), cv::Exception);
 }
 
 }  // namespace

@@ -99,5 +99,19 @@ private:
 std::string MakeTempFolder();
 void RemoveTree(const std::string& path);
 
+// A fresh temporary folder, removed with everything in it when the object
+// goes, however the test ends.
+class TempFolder {
+public:
+    TempFolder() : m_path(MakeTempFolder()) {}
+    ~TempFolder() { RemoveTree(m_path); }
+    TempFolder(const TempFolder&) = delete;
+    TempFolder& operator=(const TempFolder&) = delete;
+    const std::string& path() const { return m_path; }
+
+private:
+    std::string m_path;
+};
+
 }  // namespace fixtures
 }  // namespace vora

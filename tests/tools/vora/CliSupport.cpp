@@ -24,7 +24,8 @@ std::string Slurp(const std::string& path) {
 }
 
 RunResult RunVora(const std::string& cwd, const std::vector<std::string>& args) {
-    static const std::string capture = fixtures::MakeTempFolder();
+    static const fixtures::TempFolder folder;
+    const std::string& capture = folder.path();
     std::string command = "cd '" + cwd + "' && exec env -u VORA_MODEL '" VORA_CLI_PATH "'";
     for (const std::string& a : args) command += " '" + a + "'";  // no test argument holds a quote
     const int status = std::system((command + " >" + capture + "/out 2>" + capture + "/err").c_str());

@@ -41,8 +41,6 @@ cv::Mat ReadRgb(const std::string& path);
 class CliTest : public ::testing::Test {
 protected:
     void SetUp() override { WriteRgb(m_work + "/photo.png", m_photo); }
-    void TearDown() override { fixtures::RemoveTree(m_work); }
-
     RunResult Run(const std::vector<std::string>& args) { return RunVora(m_work, args); }
 
     // Runs a command that must be refused: its status, a single line on
@@ -50,7 +48,8 @@ protected:
     // the work folder unchanged.
     void ExpectRefused(const std::vector<std::string>& args, int status, const std::string& mentions);
 
-    std::string m_work = fixtures::MakeTempFolder();
+    fixtures::TempFolder m_workFolder;
+    std::string m_work = m_workFolder.path();
     cv::Mat m_photo = testimages::SyntheticPhotoRgb(120, 160);
     fixtures::ModelFixture m_model{fixtures::RandomDatabase(4, 12, 7)};
     const std::string m_modelDir = m_model.modelDir();
