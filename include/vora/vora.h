@@ -26,10 +26,9 @@
 // Export and version macros
 // ===========================================================================
 
-#define VORA_VERSION_MAJOR 0
-#define VORA_VERSION_MINOR 1
-#define VORA_VERSION_PATCH 0
-#define VORA_VERSION_STRING "0.1.0"
+// VORA_VERSION_MAJOR, _MINOR, _PATCH and VORA_VERSION_STRING, generated from
+// the project's version.
+#include <vora/version.h>
 
 #if defined(_WIN32)
 #define VORA_API __declspec(dllexport)
