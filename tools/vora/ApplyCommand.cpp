@@ -8,6 +8,7 @@
 #include <filesystem>
 #include <iostream>
 #include <map>
+#include <memory>
 #include <mutex>
 #include <thread>
 
@@ -103,6 +104,23 @@ cv::Size RenderOne(const vora_api& api, const TRANSFER& transfer, const Transfer
     return photo.pixels.size();
 }
 
+// The record to render, where it came from, and the model to render it with.
+struct Look {
+    TransferDocument document;
+    TRANSFER transfer;
+    std::string where;  // "file:K"
+    std::unique_ptr<vora_api> api;
+};
+
+Look LoadLook(const ParsedArgs& parsed, const TransferReference& reference) {
+    Look look;
+    look.transfer = LoadTransferRecord(reference, &look.document);
+    look.where = reference.path + ":" + std::to_string(reference.index);
+    CheckRenderable(look.transfer, look.where);
+    look.api = OpenExaminedModel(ChooseModelDirForRecord(parsed.Value("--model").value_or(""), look.document.model));
+    return look;
+}
+
 int RunBatch(const ParsedArgs& parsed, const std::vector<std::string>& photos, const TransferReference& reference,
              const std::string& outDir, bool force, double strength) {
     std::optional<std::string> format = parsed.Value("--format");
@@ -122,12 +140,7 @@ int RunBatch(const ParsedArgs& parsed, const std::vector<std::string>& photos, c
         throw UsageError(outDir + ": is not a folder (--out-dir)");
     const std::vector<BatchItem> items = PlanBatch(photos, outDir, format);
 
-    TransferDocument document;
-    const TRANSFER transfer = LoadTransferRecord(reference, &document);
-    const std::string where = reference.path + ":" + std::to_string(reference.index);
-    CheckRenderable(transfer, where);
-    const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
-    const auto api = OpenExaminedModel(modelDir);
+    const Look look = LoadLook(parsed, reference);
     std::filesystem::create_directories(outDir, ec);
     if (!std::filesystem::is_directory(outDir, ec)) throw Failure(outDir, "cannot make this folder");
 
@@ -151,8 +164,8 @@ int RunBatch(const ParsedArgs& parsed, const std::vector<std::string>& photos, c
         for (size_t i = next++; i < queue.size(); i = next++) {
             std::string failure;
             try {
-                RenderOne(*api, transfer, document, strength, parsed, queue[i]->photo, queue[i]->output, force,
-                          nullptr);
+                RenderOne(*look.api, look.transfer, look.document, strength, parsed, queue[i]->photo,
+                          queue[i]->output, force, nullptr);
             } catch (const CliError& e) {
                 failure = e.what();
             } catch (const std::exception& e) {
@@ -181,7 +194,7 @@ int RunBatch(const ParsedArgs& parsed, const std::vector<std::string>& photos, c
     for (const std::string& failure : failures) PrintError(failure);
     std::cout << "apply: " << (queue.size() - failures.size()) << " done, " << skipped << " skipped"
               << (skipped > 0 ? " (their outputs exist; --force replaces them)" : "") << ", " << failures.size()
-              << " failed; " << where << " into " << outDir << "\n";
+              << " failed; " << look.where << " into " << outDir << "\n";
     return failures.empty() ? kExitOk : kExitFailure;
 }
 
@@ -222,16 +235,13 @@ int Run(const std::vector<std::string>& args) {
     CheckImageExtension(outPath);
     CheckOutputPath(outPath, {photoPath, reference.path}, force);
 
-    TransferDocument document;
-    const TRANSFER transfer = LoadTransferRecord(reference, &document);
-    const std::string where = reference.path + ":" + std::to_string(reference.index);
-    CheckRenderable(transfer, where);
-    const std::string modelDir = ChooseModelDirForRecord(parsed.Value("--model").value_or(""), document.model);
-    const auto api = OpenExaminedModel(modelDir);
+    const Look look = LoadLook(parsed, reference);
 
     ProgressBar bar("apply");
-    const cv::Size size = RenderOne(*api, transfer, document, strength, parsed, photoPath, outPath, force, &bar);
-    std::cout << outPath << ": " << size.width << " x " << size.height << ", " << where << " (style " << transfer.styleIndex << ", cluster " << transfer.clusterIndex << ")\n";
+    const cv::Size size =
+        RenderOne(*look.api, look.transfer, look.document, strength, parsed, photoPath, outPath, force, &bar);
+    std::cout << outPath << ": " << size.width << " x " << size.height << ", " << look.where << " (style "
+              << look.transfer.styleIndex << ", cluster " << look.transfer.clusterIndex << ")\n";
     return kExitOk;
 }
 
