@@ -40,18 +40,8 @@ TEST_F(CliTest, FfmpegWithTheCubeReproducesApplyOnARealPhoto) {
     ASSERT_EQ(ours.size(), theirs.size());
     const double psnr = cv::PSNR(ours, theirs);
     const double largest = cv::norm(ours, theirs, cv::NORM_INF);
-    cv::Mat difference;
-    cv::absdiff(ours, theirs, difference);
-    const double beyondTwo = static_cast<double>(cv::countNonZero(difference.reshape(1) > 2)) /
-                             static_cast<double>(difference.total() * difference.channels());
-    cv::Mat signedDifference;
-    cv::subtract(theirs, ours, signedDifference, cv::noArray(), CV_32S);
-    const cv::Scalar bias = cv::mean(signedDifference);
     std::cout << "ffmpeg lut3d (65 points, tetrahedral) against vora apply: PSNR " << psnr << " dB, largest difference "
-              << largest << " levels, " << beyondTwo * 100 << " % of bytes off by more than 2, mean (ffmpeg - vora) "
-              << (bias[0] + bias[1] + bias[2]) / 3 << "\n";
-    RecordProperty("psnr", std::to_string(psnr));
-    RecordProperty("largest_difference", std::to_string(largest));
+              << largest << " levels\n";
     EXPECT_GE(psnr, 45.0);
     EXPECT_LE(largest, 16.0);
 }
