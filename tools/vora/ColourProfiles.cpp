@@ -118,18 +118,11 @@ ProfileKind ExamineProfile(ColourProfile& profile, bool grey, std::string* why) 
 void ConvertToSrgb(cv::Mat& pixels, const ColourProfile& profile, bool grey) {
     const Profile opened = OpenProfile(profile.bytes);
     const Profile srgb(cmsCreate_sRGBProfile());
-    if (!grey) {
-        const Transform transform = MakeTransform(opened.get(), TYPE_RGB_8, srgb.get(), TYPE_RGB_8);
-        const Transform withAlpha = MakeTransform(opened.get(), TYPE_RGBA_8, srgb.get(), TYPE_RGBA_8);
-        if (!transform || !withAlpha) throw Failure(profile.name + ": cannot convert colours to sRGB");
-        pixels = ConvertRgb(pixels, pixels.channels() == 4 ? withAlpha.get() : transform.get(), true);
-        return;
-    }
-    const Transform transform =
-        MakeTransform(opened.get(), GreyFormat(pixels.channels()), srgb.get(),
-                      pixels.channels() == 4 ? TYPE_RGBA_8 : TYPE_RGB_8);
+    const cmsUInt32Number rgb = pixels.channels() == 4 ? TYPE_RGBA_8 : TYPE_RGB_8;
+    const Transform transform = MakeTransform(opened.get(), grey ? GreyFormat(pixels.channels()) : rgb, srgb.get(), rgb);
     if (!transform) throw Failure(profile.name + ": cannot convert colours to sRGB");
-    pixels = ConvertRgb(pixels, transform.get(), false);
+    // Grey input reads one byte of each pixel and writes three: not in place.
+    pixels = ConvertRgb(pixels, transform.get(), !grey);
 }
 
 void ConvertFromSrgb(cv::Mat& pixels, const ColourProfile& profile) {
