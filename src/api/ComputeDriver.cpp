@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cassert>
 #include <cmath>
 #include <cstdint>
 
@@ -37,29 +38,26 @@ ColourStats Summarise(const IImage* image) {
 
 }  // namespace
 
-Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector<TRANSFER>& out,
+Status ComputeTransfers(const Engine& engine, const IImage& content, std::vector<TRANSFER>& out,
                         const VoraParameters& params) {
-    if (!engine || !content || out.size() < params.numTransfers) return STATUS_INVALID_ARGUMENT;
-    if (params.numTransfers == 0) return STATUS_NO_TRANSFERS_REQUESTED;
-    if (!engine->CanRankStyles()) return STATUS_MODEL_INCOMPLETE;
-
+    assert(params.numTransfers >= 1 && out.size() >= params.numTransfers && engine.CanRankStyles());
     // The statistics and the network read the caller's pixels as they stand,
     // side by side: neither keeps a copy of the image.
-    const cv::Mat rgb8 = RgbView(content);
+    const cv::Mat rgb8 = RgbView(&content);
     ColourStats stats{};
     std::array<float, 512> feature{};
     bool extracted = false;
     tbb::parallel_invoke([&] { SummariseColours(rgb8, ChannelOrder::Rgb, stats); },
-                         [&] { extracted = ExtractFeature(*engine->network, rgb8, feature.data(), ChannelOrder::Rgb); });
+                         [&] { extracted = ExtractFeature(*engine.network, rgb8, feature.data(), ChannelOrder::Rgb); });
     if (!extracted) return STATUS_MODEL_INCOMPLETE;
 
-    std::vector<int32_t> clusterOrder(engine->clusterCentres.size(), 0);
-    OrderClusters(*engine, feature.data(), clusterOrder);
+    std::vector<int32_t> clusterOrder(engine.clusterCentres.size(), 0);
+    OrderClusters(engine, feature.data(), clusterOrder);
 
     std::vector<int32_t> chosenClusters;
     std::vector<int32_t> chosenStyles;
     const Status selected =
-        SelectStyles(*engine, stats, clusterOrder, chosenClusters, chosenStyles, params);
+        SelectStyles(engine, stats, clusterOrder, chosenClusters, chosenStyles, params);
     if (selected != STATUS_OK) return selected;
 
     // Solved into copies, so a refused call leaves the caller's records as they were.
@@ -68,7 +66,7 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
         TRANSFER& record = solved[i];
         record.clusterIndex = chosenClusters[i];
         record.styleIndex = chosenStyles[i];
-        SolveTransfer(stats, engine->styleRecords[chosenStyles[i]], record, params);
+        SolveTransfer(stats, engine.styleRecords[chosenStyles[i]], record, params);
         FinishTransfer(
             rgb8.size(), [&rgb8](const cv::Rect& region) { return LabOfRegion(rgb8, region); }, params, record);
         if (!TransferIsFinite(record)) return STATUS_NON_FINITE_RESULT;
@@ -77,37 +75,17 @@ Status ComputeTransfers(const Engine* engine, const IImage* content, std::vector
     return STATUS_OK;
 }
 
-Status ComputeTransfersArray(const Engine* engine, const IImage* content, TRANSFER* out,
-                             const VoraParameters& params) {
-    if (!out) return STATUS_INVALID_ARGUMENT;
-    // Refuse before sizing the working vector, so a bad call allocates nothing.
-    if (!engine || !content) return STATUS_INVALID_ARGUMENT;
-    if (params.numTransfers == 0) return STATUS_NO_TRANSFERS_REQUESTED;
-    if (!engine->CanRankStyles()) return STATUS_MODEL_INCOMPLETE;
-
-    std::vector<TRANSFER> records(params.numTransfers);
-    // A count without an array means no faces; sizing by it would only allocate.
-    const size_t faces = params.isVoraParameterHavingFaces() ? params.numFaceRects : 0;
-    for (TRANSFER& record : records) record.faceCorrections.assign(faces, FaceCorrection{});
-
-    const Status status = ComputeTransfers(engine, content, records, params);
-    if (status != STATUS_OK) return status;
-    for (uint64_t i = 0; i < params.numTransfers; ++i) out[i] = records.at(i);
-    return status;
-}
-
-Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, TRANSFER& out,
+Status ComputeTransferToStyleImage(const IImage& content, const IImage& style, TRANSFER& out,
                                    const VoraParameters& params) {
-    if (!content || !style) return STATUS_INVALID_ARGUMENT;
     // A summary's second step sums in image order on one thread; the style's
     // first step runs beside it, and the content's chroma is freed before
     // the style's is complete, so the two never hold all of theirs at once.
     ColourStats contentStats{};
     ColourStats styleStats{};
-    PendingSummaryPtr pendingContent = BeginSummary(RgbView(content), ChannelOrder::Rgb);
+    PendingSummaryPtr pendingContent = BeginSummary(RgbView(&content), ChannelOrder::Rgb);
     PendingSummaryPtr pendingStyle;
     tbb::parallel_invoke([&] { FinishSummary(std::move(pendingContent), contentStats); },
-                         [&] { pendingStyle = BeginSummary(RgbView(style), ChannelOrder::Rgb); });
+                         [&] { pendingStyle = BeginSummary(RgbView(&style), ChannelOrder::Rgb); });
     FinishSummary(std::move(pendingStyle), styleStats);
 
     TRANSFER solved = out;
@@ -119,17 +97,15 @@ Status ComputeTransferToStyleImage(const IImage* content, const IImage* style, T
     return STATUS_OK;
 }
 
-Status ComputeTransferToStyleIndex(const Engine* engine, const IImage* content, int styleIndex, TRANSFER& out,
+Status ComputeTransferToStyleIndex(const Engine& engine, const IImage& content, size_t styleIndex, TRANSFER& out,
                                    const VoraParameters& params) {
-    if (!engine || !content) return STATUS_INVALID_ARGUMENT;
-    if (styleIndex < 0 || static_cast<size_t>(styleIndex) >= engine->styleRecords.size())
-        return STATUS_STYLE_INDEX_OUT_OF_RANGE;
+    assert(styleIndex < engine.styleRecords.size());
 
-    const ColourStats stats = Summarise(content);
+    const ColourStats stats = Summarise(&content);
     TRANSFER solved = out;
     solved.clusterIndex = -1;
-    solved.styleIndex = styleIndex;
-    SolveTransfer(stats, engine->styleRecords[styleIndex], solved, params);
+    solved.styleIndex = static_cast<int>(styleIndex);
+    SolveTransfer(stats, engine.styleRecords[styleIndex], solved, params);
     if (!TransferIsFinite(solved)) return STATUS_NON_FINITE_RESULT;
     out = std::move(solved);
     return STATUS_OK;

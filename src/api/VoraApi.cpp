@@ -1,9 +1,12 @@
-// The facade: a pointer to the engine and forwarding, nothing else.
+// The facade: a pointer to the engine, the checks at the door, and forwarding.
 #include <vora/vora.h>
 
+#include <algorithm>
+#include <cstdint>
 #include <memory>
 #include <new>
 
+#include "api/ArgumentChecks.h"
 #include "api/ComputeDriver.h"
 #include "color/ApplyTransfer.h"
 #include "model/Engine.h"
@@ -40,25 +43,43 @@ vora_api& vora_api::operator=(const vora_api& other) {
 
 Status vora_api::compute_transfers(const IImage* content, std::vector<TRANSFER>& out,
                                    const VoraParameters& params) const {
-    return ComputeTransfers(engine, content, out, params);
+    const Status checked = CheckProposalArguments(engine, content, out.size(), params);
+    if (checked != STATUS_OK) return checked;
+    return ComputeTransfers(*engine, *content, out, params);
 }
 
 Status vora_api::compute_transfers(const IImage* content, TRANSFER* out, const VoraParameters& params) const {
-    return ComputeTransfersArray(engine, content, out, params);
+    // Refused before the working vector is sized, so a bad call allocates nothing.
+    const Status checked = out ? CheckProposalArguments(engine, content, SIZE_MAX, params) : STATUS_INVALID_ARGUMENT;
+    if (checked != STATUS_OK) return checked;
+    std::vector<TRANSFER> records(params.numTransfers);
+    // A count without an array means no faces; sizing by it would only allocate.
+    const size_t faces = params.isVoraParameterHavingFaces() ? params.numFaceRects : 0;
+    for (TRANSFER& record : records) record.faceCorrections.assign(faces, FaceCorrection{});
+    const Status status = ComputeTransfers(*engine, *content, records, params);
+    if (status != STATUS_OK) return status;
+    std::move(records.begin(), records.end(), out);
+    return STATUS_OK;
 }
 
 Status vora_api::compute_transfer(const IImage* content, const IImage* style, TRANSFER& out,
                                   const VoraParameters& params) const {
-    return ComputeTransferToStyleImage(content, style, out, params);
+    if (content == nullptr || style == nullptr) return STATUS_INVALID_ARGUMENT;
+    return ComputeTransferToStyleImage(*content, *style, out, params);
 }
 
 Status vora_api::compute_transfer(const IImage* content, int styleIndex, TRANSFER& out,
                                   const VoraParameters& params) const {
-    return ComputeTransferToStyleIndex(engine, content, styleIndex, out, params);
+    const Status checked = CheckStyleIndexArguments(engine, content, styleIndex);
+    if (checked != STATUS_OK) return checked;
+    return ComputeTransferToStyleIndex(*engine, *content, static_cast<size_t>(styleIndex), out, params);
 }
 
 Status vora_api::apply_transfer(const IImage* source, const TRANSFER& transfer, IImage* destination) const {
-    return ApplyTransfer(source, transfer, destination);
+    const Status checked = CheckApplyArguments(source, destination);
+    if (checked != STATUS_OK) return checked;
+    ApplyTransfer(source, transfer, destination);
+    return STATUS_OK;
 }
 
 // User styles are a placeholder interface; index is left as the caller set it.

@@ -6,6 +6,7 @@
 #include "color/ApplyTransfer.h"
 
 #include <algorithm>
+#include <cassert>
 #include <cmath>
 #include <cstdio>
 
@@ -180,31 +181,17 @@ void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t
 
 enum class Threading { Parallel, Serial };
 
-// Input outside the contract that the kernel would turn into out-of-bounds
-// reads or writes. Only called for a non-empty source.
-bool GeometryIsUsable(const IImage& source, const IImage& destination) {
-    if (source.GetConstData() == nullptr || destination.GetConstData() == nullptr) return false;
-    // The destination is addressed with the source's strides: they must agree.
-    if (destination.GetWidth() != source.GetWidth() || destination.GetHeight() != source.GetHeight() ||
-        destination.GetRowStride() != source.GetRowStride() ||
-        destination.GetPixelStride() != source.GetPixelStride()) {
-        return false;
-    }
-    // Three colour bytes per pixel, and rows that do not overlap.
-    const size_t pixelStride = source.GetPixelStride();
-    if (pixelStride < 3) return false;
-    return source.GetWidth() <= source.GetRowStride() / pixelStride;
-}
-
-Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, Threading threading,
-             ApplyKernel kernel) {
-    if (source == nullptr || destination == nullptr) return STATUS_INVALID_ARGUMENT;
-
+void Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, Threading threading,
+           ApplyKernel kernel) {
+    assert(source != nullptr && destination != nullptr);
     const size_t rows = source->GetHeight();
     const size_t columns = source->GetWidth();
     const bool empty = rows == 0 || columns == 0;
-    // An empty source is inside the contract: nothing is read or written.
-    if (!empty && !GeometryIsUsable(*source, *destination)) return STATUS_INVALID_ARGUMENT;
+    assert(empty || (source->GetConstData() != nullptr && destination->GetData() != nullptr &&
+                     destination->GetRowStride() == source->GetRowStride() &&
+                     destination->GetPixelStride() == source->GetPixelStride() &&
+                     destination->GetWidth() == columns && destination->GetHeight() == rows &&
+                     source->GetPixelStride() >= 3 && columns <= source->GetRowStride() / source->GetPixelStride()));
 
     const CTopLeftCoordinate topLeft = source->GetTopLeft();
     const CFullResImageSize fullResSize = source->GetFullResSize();
@@ -214,22 +201,12 @@ Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination
     const int faceCount = static_cast<int>(transfer.faceCorrections.size());
     if (topLeft.left == 0 && topLeft.top == 0 && faceCount >= 1) std::printf(kCorrectFacesMessage, faceCount);
 
-    if (empty) return STATUS_OK;
+    if (empty) return;
 
-    ApplyTransferWorker worker{rows,
-                                     columns,
-                                     source->GetRowStride(),
-                                     source->GetPixelStride(),
-                                     source->GetConstData(),
-                                     transfer,
-                                     destination->GetData(),
-                                     topLeft.left,
-                                     topLeft.top,
-                                     fullResSize.width,
-                                     fullResSize.height,
-                                     faceBoxes.size(),
-                                     faceBoxes.data(),
-                                     nullptr};
+    ApplyTransferWorker worker{rows, columns, source->GetRowStride(), source->GetPixelStride(),
+                               source->GetConstData(), transfer, destination->GetData(),
+                               topLeft.left, topLeft.top, fullResSize.width, fullResSize.height,
+                               faceBoxes.size(), faceBoxes.data(), nullptr};
 
     // The cache is sized by the work of this call and lives only as long as it.
     const unsigned cacheBits = kernel == ApplyKernel::Plain ? 0 : ColourCacheBits(rows * columns);
@@ -245,7 +222,6 @@ Status Apply(const IImage* source, const TRANSFER& transfer, IImage* destination
         tbb::parallel_for(tbb::blocked_range2d<size_t, size_t>(0, rows, 1, 0, columns, columns), worker,
                           tbb::auto_partitioner(), context);
     }
-    return STATUS_OK;
 }
 
 }  // namespace
@@ -277,12 +253,12 @@ void ApplyTransferWorker::Run(size_t rowBegin, size_t rowEnd, size_t columnBegin
     }
 }
 
-Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
-    return Apply(source, transfer, destination, Threading::Parallel, kernel);
+void ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
+    Apply(source, transfer, destination, Threading::Parallel, kernel);
 }
 
-Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
-    return Apply(source, transfer, destination, Threading::Serial, kernel);
+void ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination, ApplyKernel kernel) {
+    Apply(source, transfer, destination, Threading::Serial, kernel);
 }
 
 }  // namespace vora

@@ -88,25 +88,23 @@ struct ApplyTransferWorker {
     }
 };
 
-// The library's apply: validates geometry, prints the faces line for the tile
-// at the origin, then runs the worker over bands of whole rows in parallel.
+// The library's apply: prints the faces line for the tile at the origin, then
+// runs the worker over bands of whole rows in parallel.
 //
-// Returns STATUS_OK, having changed nothing, when the source has zero rows or
-// zero columns. Returns STATUS_INVALID_ARGUMENT, having written no pixel and
-// printed nothing, for input that would otherwise be read or written out of
-// bounds: a null source or destination object; a null source or destination
-// pixel pointer; a destination whose width, height, row stride or pixel
-// stride differs from the source's; a pixel stride below 3; a row stride
-// shorter than a row of pixels.
+// The caller has checked the arguments (the facade's CheckApplyArguments):
+// both objects exist and, unless the source has zero rows or columns (then
+// nothing is read or written), both have pixels, the same width, height and
+// strides, a pixel stride of at least 3 and rows no closer than a row of
+// pixels. Debug builds assert this.
 //
 // A call over at least kColourCacheMinPixels pixels keeps, per thread that
 // takes part, a colour cache of 8 << ColourCacheBits(pixels) bytes (at most
 // 2 MiB), freed before it returns.
-Status ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination,
-                     ApplyKernel kernel = ApplyKernel::Fastest);
+void ApplyTransfer(const IImage* source, const TRANSFER& transfer, IImage* destination,
+                   ApplyKernel kernel = ApplyKernel::Fastest);
 
 // The same work on the calling thread only (for tests and thread-free callers).
-Status ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination,
-                           ApplyKernel kernel = ApplyKernel::Fastest);
+void ApplyTransferSerial(const IImage* source, const TRANSFER& transfer, IImage* destination,
+                         ApplyKernel kernel = ApplyKernel::Fastest);
 
 }  // namespace vora

@@ -1,6 +1,7 @@
 #include "semantic/StyleRanking.h"
 
 #include <algorithm>
+#include <cassert>
 #include <cfloat>
 #include <cmath>
 
@@ -38,7 +39,7 @@ Status SelectStyles(const Engine& engine, const ColourStats& /*content*/, const 
                     std::vector<int32_t>& chosenClusters, std::vector<int32_t>& chosenStyles,
                     const VoraParameters& params) {
     const uint64_t wanted = params.numTransfers;
-    if (wanted == 0) return STATUS_NO_TRANSFERS_REQUESTED;
+    assert(wanted >= 1);  // checked at the library's door
     if (order.empty() || order[0] < 0 || static_cast<size_t>(order[0]) >= engine.rankedStyles.size())
         return STATUS_MODEL_INCOMPLETE;
 

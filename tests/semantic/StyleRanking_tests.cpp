@@ -57,7 +57,6 @@ TEST(SelectStyles, ChoosesInScoreOrderKeepingStylesApart) {
 
 TEST(SelectStyles, RefusesSelectionsThatCouldNeverFinishAndEndsWithExtremeFactors) {
     EXPECT_EQ(Select({{-1, -1}}, Roots(2, 1), 2, 1.0f), Refused(STATUS_NO_USABLE_STYLE));
-    EXPECT_EQ(Select({{0, 1}}, Roots(2, 1), 0, 1.0f), Refused(STATUS_NO_TRANSFERS_REQUESTED));
     EXPECT_EQ(Select({{0, 1}}, Roots(2, 1), 1, 1.0f, 5), Refused(STATUS_MODEL_INCOMPLETE));  // no cluster 5
     const std::regex threeStyles("styles( [01]){3} from( 0){3}");
     const float infinity = std::numeric_limits<float>::infinity(), nan = std::numeric_limits<float>::quiet_NaN();
