@@ -14,8 +14,10 @@
 
 #include "vora/Cli.h"
 #include "vora/Images.h"
-#include "vora/Library.h"
+#include "vora/ModelChoice.h"
 #include "vora/OutputFiles.h"
+#include "vora/ProgressBar.h"
+#include "vora/Rendering.h"
 #include "vora/TransferJson.h"
 
 namespace vora {

@@ -14,8 +14,9 @@
 #include "modelkit/ModelBuilder.h"
 #include "modelkit/TfjsConverter.h"
 #include "vora/Cli.h"
-#include "vora/Library.h"
 #include "vora/ModelFiles.h"
+#include "vora/NetworkCheck.h"
+#include "vora/ProgressBar.h"
 
 namespace vora {
 namespace cli {

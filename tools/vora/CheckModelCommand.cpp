@@ -7,8 +7,9 @@
 #include <string>
 
 #include "vora/Cli.h"
-#include "vora/Library.h"
+#include "vora/ModelChoice.h"
 #include "vora/ModelFiles.h"
+#include "vora/NetworkCheck.h"
 
 namespace vora {
 namespace cli {

@@ -8,8 +8,9 @@
 #include <string>
 
 #include "vora/Cli.h"
-#include "vora/Library.h"
+#include "vora/ModelChoice.h"
 #include "vora/OutputFiles.h"
+#include "vora/Rendering.h"
 #include "vora/TransferJson.h"
 
 namespace vora {

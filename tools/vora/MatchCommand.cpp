@@ -7,8 +7,11 @@
 #include "vora/Cli.h"
 #include "vora/Images.h"
 #include "vora/Library.h"
+#include "vora/ModelChoice.h"
 #include "vora/ModelFiles.h"
 #include "vora/OutputFiles.h"
+#include "vora/ProgressBar.h"
+#include "vora/Rendering.h"
 #include "vora/TransferJson.h"
 
 namespace vora {

@@ -11,8 +11,11 @@
 #include "vora/FaceDetection.h"
 #include "vora/Images.h"
 #include "vora/Library.h"
+#include "vora/ModelChoice.h"
 #include "vora/ModelFiles.h"
 #include "vora/OutputFiles.h"
+#include "vora/ProgressBar.h"
+#include "vora/Rendering.h"
 #include "vora/TransferJson.h"
 
 namespace vora {
