@@ -154,105 +154,111 @@ std::vector<float> ClusterStyleScores(const cv::Mat& centres, const cv::Mat& sty
     return scores;
 }
 
-}  // namespace
+// The photos a build reads and how many clusters it makes, checked before
+// anything is written.
+struct BuildPlan {
+    std::vector<std::string> stylePaths;
+    std::vector<std::string> contentPaths;
+    int samples = 0;  // content samples to cluster
+    int clusters = 0;
+};
 
-void BuildModel(const BuildModelOptions& options) {
+BuildPlan PlanBuild(const BuildModelOptions& options) {
     if (options.stylesDir.empty()) throw std::runtime_error("no style photo folder given");
     if (options.outDir.empty()) throw std::runtime_error("no model folder given");
     if (options.clusters < 0) throw std::runtime_error("the number of clusters cannot be negative");
 
     Report(options, 0.0, "listing photos");
-    const std::vector<std::string> stylePaths = ListPhotos(options.stylesDir);
-    if (stylePaths.size() < 2)
+    BuildPlan plan;
+    plan.stylePaths = ListPhotos(options.stylesDir);
+    if (plan.stylePaths.size() < 2)
         throw std::runtime_error("need at least 2 style photos in " + options.stylesDir + ", found " +
-                                 std::to_string(stylePaths.size()) +
+                                 std::to_string(plan.stylePaths.size()) +
                                  " (the library offers only the better half of the styles)");
-    std::vector<std::string> contentPaths;
     if (!options.contentDir.empty()) {
-        contentPaths = ListPhotos(options.contentDir);
-        if (contentPaths.empty()) throw std::runtime_error("no photos in " + options.contentDir);
+        plan.contentPaths = ListPhotos(options.contentDir);
+        if (plan.contentPaths.empty()) throw std::runtime_error("no photos in " + options.contentDir);
     }
     // Each style photo gives itself and its altered copies, unless content
     // photos are given.
-    const int samples = contentPaths.empty() ? static_cast<int>(stylePaths.size() * (1 + AllAlterations().size()))
-                                             : static_cast<int>(contentPaths.size());
-    int clusters = options.clusters;
-    if (clusters == 0) {
-        clusters = std::min({kMaxDefaultClusters, samples,
-                             std::max(1, static_cast<int>(std::lround(double(samples) / kSamplesPerCluster)))});
-    } else if (clusters > samples) {
-        throw std::runtime_error("cannot make " + std::to_string(clusters) + " clusters from " + std::to_string(samples) +
-                                 " content samples; ask for at most " + std::to_string(samples));
+    plan.samples = plan.contentPaths.empty()
+                       ? static_cast<int>(plan.stylePaths.size() * (1 + AllAlterations().size()))
+                       : static_cast<int>(plan.contentPaths.size());
+    plan.clusters = options.clusters;
+    if (plan.clusters == 0) {
+        plan.clusters = std::min({kMaxDefaultClusters, plan.samples,
+                                  std::max(1, static_cast<int>(std::lround(double(plan.samples) / kSamplesPerCluster)))});
+    } else if (plan.clusters > plan.samples) {
+        throw std::runtime_error("cannot make " + std::to_string(plan.clusters) + " clusters from " +
+                                 std::to_string(plan.samples) + " content samples; ask for at most " +
+                                 std::to_string(plan.samples));
     }
+    return plan;
+}
 
-    Staging staging(options.outDir);
-    // A given network is the model's own and its output the feature; the
-    // scene descriptor's pooled values are mapped by a fit made below.
-    const bool fixedNetwork = options.network != nullptr;
-    const fs::path pooledDir = staging.path() / (fixedNetwork ? "net" : "pooled");
-    WriteNetworkFiles(fixedNetwork ? *options.network : PooledFeatureNetwork(), pooledDir.string());
-    std::unique_ptr<FeatureNetwork> pooledNet =
-        FeatureNetwork::Load((pooledDir / kNetworkDefinitionName).string(), (pooledDir / kNetworkWeightsName).string());
-    const int pooledSize = fixedNetwork ? kDescriptorSize : PooledFeatureSize();
+// What the photos give: the style records, each style's own feature row and
+// the content samples' rows (pooled values, or the given network's feature).
+struct PhotoFeatures {
+    std::vector<ColourStats> styles;
+    cv::Mat stylePooled;
+    cv::Mat contentPooled;
+};
 
-    // Style records, each style's own pooled feature, and the content samples.
-    const int styleCount = static_cast<int>(stylePaths.size());
-    const double photoCount = static_cast<double>(stylePaths.size() + contentPaths.size());
-    std::vector<ColourStats> styles(stylePaths.size());
-    cv::Mat stylePooled(0, pooledSize, CV_32F);
-    cv::Mat contentPooled(0, pooledSize, CV_32F);
-    for (int s = 0; s < styleCount; ++s) {
-        Report(options, 0.8 * s / photoCount, "reading " + fs::path(stylePaths[s]).filename().string());
-        const cv::Mat photo = ReadPhotoBgr(stylePaths[s]);
-        styles[s] = StyleStats(photo);
-        stylePooled.push_back(PooledRow(*pooledNet, photo, pooledSize));
-        if (contentPaths.empty()) {
-            contentPooled.push_back(stylePooled.row(s));
-            for (Alteration alteration : AllAlterations()) contentPooled.push_back(PooledRow(*pooledNet, Alter(photo, alteration), pooledSize));
+PhotoFeatures ReadPhotos(const BuildModelOptions& options, const BuildPlan& plan, FeatureNetwork& net,
+                         int pooledSize) {
+    const size_t styleCount = plan.stylePaths.size();
+    const double photoCount = static_cast<double>(styleCount + plan.contentPaths.size());
+    PhotoFeatures features{std::vector<ColourStats>(styleCount), cv::Mat(0, pooledSize, CV_32F),
+                           cv::Mat(0, pooledSize, CV_32F)};
+    for (size_t s = 0; s < styleCount; ++s) {
+        Report(options, 0.8 * s / photoCount, "reading " + fs::path(plan.stylePaths[s]).filename().string());
+        const cv::Mat photo = ReadPhotoBgr(plan.stylePaths[s]);
+        features.styles[s] = StyleStats(photo);
+        features.stylePooled.push_back(PooledRow(net, photo, pooledSize));
+        if (plan.contentPaths.empty()) {
+            features.contentPooled.push_back(features.stylePooled.row(static_cast<int>(s)));
+            for (Alteration alteration : AllAlterations())
+                features.contentPooled.push_back(PooledRow(net, Alter(photo, alteration), pooledSize));
         }
     }
-    for (size_t c = 0; c < contentPaths.size(); ++c) {
-        Report(options, 0.8 * (styleCount + c) / photoCount, "reading " + fs::path(contentPaths[c]).filename().string());
-        contentPooled.push_back(PooledRow(*pooledNet, ReadPhotoBgr(contentPaths[c]), pooledSize));
+    for (size_t c = 0; c < plan.contentPaths.size(); ++c) {
+        Report(options, 0.8 * (styleCount + c) / photoCount,
+               "reading " + fs::path(plan.contentPaths[c]).filename().string());
+        features.contentPooled.push_back(PooledRow(net, ReadPhotoBgr(plan.contentPaths[c]), pooledSize));
     }
-    pooledNet.reset();
+    return features;
+}
 
-    // The final map of the descriptor, fitted on every photo seen.
-    Projection projection;
-    cv::Mat styleFeatures = stylePooled, contentFeatures = contentPooled;
-    if (!fixedNetwork) {
-        Report(options, 0.8, "fitting the scene descriptor");
-        cv::Mat fitRows = contentPooled.clone();
-        if (!contentPaths.empty()) fitRows.push_back(stylePooled);
-        projection = FitProjection(fitRows);
-        auto describe = [&](const cv::Mat& pooled) {
-            cv::Mat out(pooled.rows, kDescriptorSize, CV_32F);
-            for (int r = 0; r < pooled.rows; ++r) {
-                const std::vector<float> row = Project(projection, pooled.ptr<float>(r));
-                std::memcpy(out.ptr<float>(r), row.data(), row.size() * sizeof(float));
-            }
-            return out;
-        };
-        styleFeatures = describe(stylePooled);
-        contentFeatures = describe(contentPooled);
+// The rows through the descriptor's final map.
+cv::Mat Describe(const Projection& projection, const cv::Mat& pooled) {
+    cv::Mat out(pooled.rows, kDescriptorSize, CV_32F);
+    for (int r = 0; r < pooled.rows; ++r) {
+        const std::vector<float> row = Project(projection, pooled.ptr<float>(r));
+        std::memcpy(out.ptr<float>(r), row.data(), row.size() * sizeof(float));
     }
+    return out;
+}
 
-    // Semantic clusters of the content samples.
-    Report(options, 0.85, "clustering " + std::to_string(samples) + " samples into " + std::to_string(clusters));
+// Semantic clusters of the content samples: their centres, one per row. The
+// seed is fixed, so a build is reproducible, and OpenCV's own generator is
+// left as it was.
+cv::Mat ClusterCentres(const cv::Mat& contentFeatures, int clusters) {
     cv::Mat labels, centres;
-    {
-        cv::RNG& rng = cv::theRNG();
-        const uint64 saved = rng.state;
-        rng.state = kClusterSeed;
-        cv::kmeans(contentFeatures, clusters, labels,
-                   cv::TermCriteria(cv::TermCriteria::COUNT + cv::TermCriteria::EPS, 100, 1e-4), kClusterAttempts,
-                   cv::KMEANS_PP_CENTERS, centres);
-        rng.state = saved;
-    }
+    cv::RNG& rng = cv::theRNG();
+    const uint64 saved = rng.state;
+    rng.state = kClusterSeed;
+    cv::kmeans(contentFeatures, clusters, labels,
+               cv::TermCriteria(cv::TermCriteria::COUNT + cv::TermCriteria::EPS, 100, 1e-4), kClusterAttempts,
+               cv::KMEANS_PP_CENTERS, centres);
+    rng.state = saved;
+    return centres;
+}
 
-    // Files, staged.
-    Report(options, 0.95, "writing the model");
-    const fs::path stage = staging.path();
+// The four data files, into the staging folder.
+void WriteDataFiles(const fs::path& stage, const cv::Mat& centres, const std::vector<ColourStats>& styles,
+                    const cv::Mat& styleFeatures) {
+    const int clusters = centres.rows;
+    const int styleCount = static_cast<int>(styles.size());
     {
         BinaryFile file(stage / kClusterFileName);
         file.Int(clusters);
@@ -284,8 +290,45 @@ void BuildModel(const BuildModelOptions& options) {
         }
         file.Close();
     }
-    if (!fixedNetwork) WriteNetworkFiles(DescriptorNetwork(projection), (stage / "net").string());
+}
 
+}  // namespace
+
+void BuildModel(const BuildModelOptions& options) {
+    const BuildPlan plan = PlanBuild(options);
+    Staging staging(options.outDir);
+
+    // A given network is the model's own and its output the feature; the
+    // scene descriptor's pooled values are mapped by a fit made below.
+    const bool fixedNetwork = options.network != nullptr;
+    const fs::path pooledDir = staging.path() / (fixedNetwork ? "net" : "pooled");
+    WriteNetworkFiles(fixedNetwork ? *options.network : PooledFeatureNetwork(), pooledDir.string());
+    PhotoFeatures features;
+    {
+        const std::unique_ptr<FeatureNetwork> pooledNet = FeatureNetwork::Load(
+            (pooledDir / kNetworkDefinitionName).string(), (pooledDir / kNetworkWeightsName).string());
+        features = ReadPhotos(options, plan, *pooledNet, fixedNetwork ? kDescriptorSize : PooledFeatureSize());
+    }
+
+    // The final map of the descriptor, fitted on every photo seen.
+    Projection projection;
+    cv::Mat styleFeatures = features.stylePooled, contentFeatures = features.contentPooled;
+    if (!fixedNetwork) {
+        Report(options, 0.8, "fitting the scene descriptor");
+        cv::Mat fitRows = features.contentPooled.clone();
+        if (!plan.contentPaths.empty()) fitRows.push_back(features.stylePooled);
+        projection = FitProjection(fitRows);
+        styleFeatures = Describe(projection, features.stylePooled);
+        contentFeatures = Describe(projection, features.contentPooled);
+    }
+
+    Report(options, 0.85,
+           "clustering " + std::to_string(plan.samples) + " samples into " + std::to_string(plan.clusters));
+    const cv::Mat centres = ClusterCentres(contentFeatures, plan.clusters);
+
+    Report(options, 0.95, "writing the model");
+    WriteDataFiles(staging.path(), centres, features.styles, styleFeatures);
+    if (!fixedNetwork) WriteNetworkFiles(DescriptorNetwork(projection), (staging.path() / "net").string());
     const std::string net = kNetworkFolder;
     staging.Publish({kClusterFileName, kStyleFileName, kScoresFileName, kDistanceFileName,
                      net + kNetworkDefinitionName, net + kNetworkWeightsName});

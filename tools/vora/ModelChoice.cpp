@@ -56,12 +56,17 @@ std::unique_ptr<vora_api> OpenModel(const std::string& dir) {
     }
 }
 
-std::unique_ptr<vora_api> OpenExaminedModel(const std::string& dir) {
+ModelExamination ExamineSoundModel(const std::string& dir) {
     RequireModelDirectory(dir);
-    const ModelExamination model = ExamineModelFiles(dir);
+    ModelExamination model = ExamineModelFiles(dir);
     if (model.broken())
         throw Failure(dir, "the model is broken: " + model.problems.front() + " (run 'vora inspect " + dir +
                                "' for the full report)");
+    return model;
+}
+
+std::unique_ptr<vora_api> OpenExaminedModel(const std::string& dir) {
+    (void)ExamineSoundModel(dir);
     return OpenModel(dir);
 }
 

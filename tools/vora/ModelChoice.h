@@ -33,6 +33,12 @@ void RequireModelDirectory(const std::string& dir);
 // exception, which is turned into one line here).
 std::unique_ptr<vora_api> OpenModel(const std::string& dir);
 
+struct ModelExamination;
+
+// Examines the model's files (ModelFiles.h): Failure naming the first problem
+// when they are broken, before the library reads them.
+ModelExamination ExamineSoundModel(const std::string& dir);
+
 // OpenModel after examining the model's files (ModelFiles.h): Failure naming
 // the first problem when they are broken, before the library reads them.
 std::unique_ptr<vora_api> OpenExaminedModel(const std::string& dir);

@@ -5,6 +5,9 @@
 #include <cctype>
 #include <filesystem>
 #include <iostream>
+#include <optional>
+#include <string>
+#include <vector>
 
 #include "vora/Cli.h"
 #include "vora/ContactSheet.h"
@@ -101,6 +104,160 @@ std::string ChooseFormat(const std::string& given, const std::string& photoPath)
     return "png";
 }
 
+// What the command line asks for, checked before anything is read.
+struct SuggestRequest {
+    std::string photoPath;
+    bool force = false;
+    VoraParameters params;
+    FaceRequest faces;
+    FaceDetector detector = DefaultFaceDetector();
+    int previewSide = kDefaultPreviewSide;  // 0: full resolution
+    double strength = 1.0;
+    std::string format;
+    std::string modelDir;
+};
+
+SuggestRequest ParseRequest(const ParsedArgs& parsed) {
+    parsed.ExpectPositionals(1, 1, kSynopsis);
+    SuggestRequest request;
+    request.photoPath = parsed.positionals()[0];
+    request.force = parsed.Flag("--force");
+    VoraParameters& params = request.params;
+    if (auto v = parsed.Value("-n")) params.numTransfers = static_cast<uint64_t>(ParseInteger(*v, "-n", 1, kMaxProposals));
+    if (auto v = parsed.Value("--ranking")) params.rankingFactor = ParseFactor(*v, "--ranking", 0.0, false, 100.0);
+    if (auto v = parsed.Value("--solve")) params.solveFactor = ParseFactor(*v, "--solve", 0.0, true, 100.0);
+    if (auto v = parsed.Value("--limit")) params.limitFactor = ParseFactor(*v, "--limit", 0.0, false, 100.0);
+    if (auto v = parsed.Value("--finish")) params.finishFactor = ParseFactor(*v, "--finish", 0.0, false, 2.0);
+    request.faces = ParseFaceRequest(parsed.Values("--faces"));
+    if (auto d = parsed.Value("--detector")) {
+        request.detector = ParseFaceDetector(*d);
+        if (request.faces.kind != FaceRequest::Auto) throw UsageError("--detector: only used with --faces auto");
+    }
+    if (parsed.Flag("--full") && parsed.Value("--preview"))
+        throw UsageError("--full and --preview: choose one (--full renders at full resolution)");
+    if (parsed.Flag("--full"))
+        request.previewSide = 0;
+    else if (auto v = parsed.Value("--preview"))
+        request.previewSide = static_cast<int>(ParseInteger(*v, "--preview", 16, 65536));
+    request.strength = StrengthOption(parsed.Value("--strength"));
+    request.format = ChooseFormat(parsed.Value("--format").value_or(""), request.photoPath);
+    request.modelDir = ChooseModelDir(parsed.Value("--model").value_or(""));
+    return request;
+}
+
+// The files a run writes.
+struct SuggestOutputs {
+    std::string stem;
+    fs::path folder;
+    std::vector<std::string> proposals;
+    std::string sheet;
+    std::string transfers;
+};
+
+// Names every output and checks each before any work. Proposals of an
+// earlier run in another format or number would sit beside the new set and
+// no longer match its transfers.json, so they are refused unless --force.
+SuggestOutputs PlanOutputs(const SuggestRequest& request, const std::optional<std::string>& out) {
+    SuggestOutputs outputs;
+    outputs.stem = fs::path(request.photoPath).stem().string();
+    outputs.folder = out.value_or(outputs.stem + "-vora");
+    std::error_code ec;
+    if (fs::exists(outputs.folder, ec) && !fs::is_directory(outputs.folder, ec))
+        throw UsageError(outputs.folder.string() + ": exists and is not a folder (--out names a folder)");
+    for (uint64_t k = 0; k < request.params.numTransfers; ++k)
+        outputs.proposals.push_back(
+            (outputs.folder / (outputs.stem + "-" + std::to_string(k) + "." + request.format)).string());
+    outputs.sheet = (outputs.folder / "contact-sheet.png").string();
+    outputs.transfers = (outputs.folder / "transfers.json").string();
+    if (!fs::is_directory(outputs.folder, ec)) return outputs;
+    if (!request.force) {
+        for (const auto& entry : fs::directory_iterator(outputs.folder, ec)) {
+            const std::string name = entry.path().filename().string();
+            if (IsProposalName(name, outputs.stem))
+                throw UsageError((outputs.folder / name).string() +
+                                 ": a proposal of an earlier run is in the output folder; refusing to mix the "
+                                 "sets (use --force, or another --out)");
+        }
+    }
+    for (const std::string& path : outputs.proposals) CheckOutputPath(path, {request.photoPath}, request.force);
+    CheckOutputPath(outputs.sheet, {request.photoPath}, request.force);
+    CheckOutputPath(outputs.transfers, {request.photoPath}, request.force);
+    return outputs;
+}
+
+// The model's files are examined first, because the library loads silently
+// and would only say "incomplete" later.
+void CheckModelServes(const SuggestRequest& request) {
+    const ModelExamination model = ExamineSoundModel(request.modelDir);
+    if (static_cast<int64_t>(request.params.numTransfers) > model.stylesPerCluster())
+        throw UsageError("-n: " + std::to_string(request.params.numTransfers) + " is more than the " +
+                         std::to_string(model.stylesPerCluster()) +
+                         " styles this model keeps per scene; proposals would repeat");
+}
+
+std::string CountOfFaces(size_t count, const std::string& how) {
+    return std::to_string(count) + (count == 1 ? " face " : " faces ") + how;
+}
+
+// Fills the document's faces as asked; returns the note printed and shown on the sheet.
+std::string PlaceFaces(const SuggestRequest& request, const cv::Mat& rgb, TransferDocument& document) {
+    switch (request.faces.kind) {
+    case FaceRequest::Auto:
+        for (const DetectedFace& face : DetectFaces(rgb, request.detector)) document.faces.push_back(face.box);
+        document.faceSource = "auto";
+        return CountOfFaces(document.faces.size(), "found (" + FaceDetectorName(request.detector) + ")");
+    case FaceRequest::Given:
+        document.faces = request.faces.boxes;
+        document.faceSource = "given";
+        return CountOfFaces(document.faces.size(), "given");
+    case FaceRequest::None:
+        break;
+    }
+    document.faceSource = "none";
+    return "no face correction";
+}
+
+// The library's proposals for the packed R, G, B pixels, with the faces.
+void ComputeProposals(const vora_api& api, const SuggestRequest& request, cv::Mat& rgb, TransferDocument& document) {
+    VoraParameters params = request.params;
+    std::vector<CFaceRect> faceRects;
+    for (const FaceBox& f : document.faces) faceRects.emplace_back(f.left, f.right, f.top, f.bottom);
+    params.faceRects = faceRects.empty() ? nullptr : faceRects.data();
+    params.numFaceRects = static_cast<uint32_t>(faceRects.size());
+    ImageHandle image = WrapWholeImage(rgb);
+    document.transfers.resize(params.numTransfers);
+    CheckStatus(api.compute_transfers(image.get(), document.transfers, params), request.photoPath);
+    for (size_t k = 0; k < document.transfers.size(); ++k)
+        CheckRenderable(document.transfers[k], request.photoPath + ": proposal " + std::to_string(k));
+}
+
+// Renders every proposal on `shown` into the staging folder; returns the
+// contact sheet's entries, the original first.
+std::vector<SheetEntry> RenderProposals(const vora_api& api, const SuggestRequest& request, const ParsedArgs& parsed,
+                                        const Photo& photo, const cv::Mat& shown, const TransferDocument& document,
+                                        const SuggestOutputs& outputs, StagingFolder& staging) {
+    std::vector<SheetEntry> sheet;
+    sheet.push_back({MakeThumbnail(shown, kThumbnailSide), "original", outputs.stem});
+    ProgressBar bar("suggest");
+    const double share = 1.0 / static_cast<double>(document.transfers.size());
+    for (size_t k = 0; k < document.transfers.size(); ++k) {
+        const TRANSFER& t = document.transfers[k];
+        cv::Mat rendered = shown.clone();
+        RenderInPlace(api, rendered, t, &bar, share * k, share * (k + 1));
+        MixWithOriginal(shown, rendered, request.strength);
+        WriteImage(staging.PathFor(fs::path(outputs.proposals[k]).filename().string()), rendered, false,
+                   ImageTagsFor(parsed, photo));
+        const std::string faces = t.faceCorrections.empty()
+                                      ? std::string()
+                                      : ", " + std::to_string(t.faceCorrections.size()) + " face(s) lifted";
+        sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),
+                         "#" + std::to_string(k) + "  style " + std::to_string(t.styleIndex),
+                         "cluster " + std::to_string(t.clusterIndex) + faces});
+    }
+    bar.Finish();
+    return sheet;
+}
+
 int Run(const std::vector<std::string>& args) {
     ParsedArgs parsed("suggest",
                       {ValueOption("-n"), ValueOption("--model"), RepeatedOption("--faces"), ValueOption("--detector"),
@@ -109,158 +266,50 @@ int Run(const std::vector<std::string>& args) {
                        ValueOption("--max-pixels"), ValueOption("--preview"), FlagOption("--full"),
                        ValueOption("--strength"), FlagOption("--keep-profile"), FlagOption("--strip-metadata")},
                       args);
-    parsed.ExpectPositionals(1, 1, kSynopsis);
-    const std::string photoPath = parsed.positionals()[0];
-    const bool force = parsed.Flag("--force");
+    const SuggestRequest request = ParseRequest(parsed);
+    const SuggestOutputs outputs = PlanOutputs(request, parsed.Value("--out"));
+    CheckModelServes(request);
 
-    // Parameters, checked before anything is read.
-    VoraParameters params;
-    if (auto v = parsed.Value("-n")) params.numTransfers = static_cast<uint64_t>(ParseInteger(*v, "-n", 1, kMaxProposals));
-    if (auto v = parsed.Value("--ranking")) params.rankingFactor = ParseFactor(*v, "--ranking", 0.0, false, 100.0);
-    if (auto v = parsed.Value("--solve")) params.solveFactor = ParseFactor(*v, "--solve", 0.0, true, 100.0);
-    if (auto v = parsed.Value("--limit")) params.limitFactor = ParseFactor(*v, "--limit", 0.0, false, 100.0);
-    if (auto v = parsed.Value("--finish")) params.finishFactor = ParseFactor(*v, "--finish", 0.0, false, 2.0);
-    const FaceRequest faceRequest = ParseFaceRequest(parsed.Values("--faces"));
-    FaceDetector detector = DefaultFaceDetector();
-    if (auto d = parsed.Value("--detector")) {
-        detector = ParseFaceDetector(*d);
-        if (faceRequest.kind != FaceRequest::Auto) throw UsageError("--detector: only used with --faces auto");
-    }
-    if (parsed.Flag("--full") && parsed.Value("--preview"))
-        throw UsageError("--full and --preview: choose one (--full renders at full resolution)");
-    const int previewSide = parsed.Flag("--full") ? 0
-                            : parsed.Value("--preview")
-                                ? static_cast<int>(ParseInteger(*parsed.Value("--preview"), "--preview", 16, 65536))
-                                : kDefaultPreviewSide;
-    const double strength = StrengthOption(parsed.Value("--strength"));
-    const std::string format = ChooseFormat(parsed.Value("--format").value_or(""), photoPath);
-
-    // Outputs: every file is checked before any work.
-    const std::string stem = fs::path(photoPath).stem().string();
-    const fs::path outDir = parsed.Value("--out").value_or(stem + "-vora");
-    std::error_code ec;
-    if (fs::exists(outDir, ec) && !fs::is_directory(outDir, ec))
-        throw UsageError(outDir.string() + ": exists and is not a folder (--out names a folder)");
-    std::vector<std::string> proposalPaths;
-    for (uint64_t k = 0; k < params.numTransfers; ++k)
-        proposalPaths.push_back((outDir / (stem + "-" + std::to_string(k) + "." + format)).string());
-    const std::string sheetPath = (outDir / "contact-sheet.png").string();
-    const std::string jsonPath = (outDir / "transfers.json").string();
-    if (fs::is_directory(outDir, ec)) {
-        // Proposals of an earlier run in another format or number would sit
-        // beside the new set and no longer match its transfers.json.
-        if (!force) {
-            for (const auto& entry : fs::directory_iterator(outDir, ec)) {
-                const std::string name = entry.path().filename().string();
-                if (IsProposalName(name, stem))
-                    throw UsageError((outDir / name).string() +
-                                     ": a proposal of an earlier run is in the output folder; refusing to mix the "
-                                     "sets (use --force, or another --out)");
-            }
-        }
-        for (const std::string& path : proposalPaths) CheckOutputPath(path, {photoPath}, force);
-        CheckOutputPath(sheetPath, {photoPath}, force);
-        CheckOutputPath(jsonPath, {photoPath}, force);
-    }
-
-    // The model: its files are examined first, because the library loads
-    // silently and would only say "incomplete" later.
-    const std::string modelDir = ChooseModelDir(parsed.Value("--model").value_or(""));
-    RequireModelDirectory(modelDir);
-    const ModelExamination model = ExamineModelFiles(modelDir);
-    if (model.broken())
-        throw Failure(modelDir, "the model is broken: " + model.problems.front() + " (run 'vora inspect " + modelDir +
-                                    "' for the full report)");
-    if (static_cast<int64_t>(params.numTransfers) > model.stylesPerCluster())
-        throw UsageError("-n: " + std::to_string(params.numTransfers) + " is more than the " +
-                         std::to_string(model.stylesPerCluster()) +
-                         " styles this model keeps per scene; proposals would repeat");
-
-    Photo photo = ReadPhotoRgb(photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
+    Photo photo = ReadPhotoRgb(request.photoPath, MaxPixelsOption(parsed.Value("--max-pixels")));
     cv::Mat rgb = PackedRgb(photo);  // compute reads packed R, G, B only
-
     TransferDocument document;
-    document.model = AbsoluteModelPath(modelDir);
-    document.photo = photoPath;
+    document.model = AbsoluteModelPath(request.modelDir);
+    document.photo = request.photoPath;
     document.photoWidth = static_cast<uint64_t>(photo.pixels.cols);
     document.photoHeight = static_cast<uint64_t>(photo.pixels.rows);
-    document.numTransfers = params.numTransfers;
-    document.rankingFactor = params.rankingFactor;
-    document.solveFactor = params.solveFactor;
-    document.limitFactor = params.limitFactor;
-    document.finishFactor = params.finishFactor;
-    std::string faceNote;
-    switch (faceRequest.kind) {
-    case FaceRequest::Auto:
-        for (const DetectedFace& face : DetectFaces(rgb, detector)) document.faces.push_back(face.box);
-        document.faceSource = "auto";
-        faceNote = std::to_string(document.faces.size()) + (document.faces.size() == 1 ? " face" : " faces") +
-                   " found (" + FaceDetectorName(detector) + ")";
-        break;
-    case FaceRequest::Given:
-        document.faces = faceRequest.boxes;
-        document.faceSource = "given";
-        faceNote = std::to_string(document.faces.size()) + (document.faces.size() == 1 ? " face" : " faces") + " given";
-        break;
-    case FaceRequest::None:
-        document.faceSource = "none";
-        faceNote = "no face correction";
-        break;
-    }
-    std::vector<CFaceRect> faceRects;
-    for (const FaceBox& f : document.faces) faceRects.emplace_back(f.left, f.right, f.top, f.bottom);
-    params.faceRects = faceRects.empty() ? nullptr : faceRects.data();
-    params.numFaceRects = static_cast<uint32_t>(faceRects.size());
+    document.numTransfers = request.params.numTransfers;
+    document.rankingFactor = request.params.rankingFactor;
+    document.solveFactor = request.params.solveFactor;
+    document.limitFactor = request.params.limitFactor;
+    document.finishFactor = request.params.finishFactor;
+    const std::string faceNote = PlaceFaces(request, rgb, document);
+    const auto api = OpenModel(request.modelDir);
+    ComputeProposals(*api, request, rgb, document);
+    std::cout << request.photoPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << faceNote
+              << "\n";
 
-    const auto api = OpenModel(modelDir);
-    ImageHandle image = WrapWholeImage(rgb);
-    document.transfers.resize(params.numTransfers);
-    CheckStatus(api->compute_transfers(image.get(), document.transfers, params), photoPath);
-    image.reset();
-    for (size_t k = 0; k < document.transfers.size(); ++k)
-        CheckRenderable(document.transfers[k], photoPath + ": proposal " + std::to_string(k));
-
-    std::cout << photoPath << ": " << photo.pixels.cols << " x " << photo.pixels.rows << ", " << faceNote << "\n";
     // The set is written into a staging folder and moved into place at the
     // end: a failure midway (a full disk) or an interrupt leaves nothing, so
-    // the command can simply be run again.
-    StagingFolder staging(outDir.string());
-    const auto staged = [&staging](const std::string& path) {
-        return staging.PathFor(fs::path(path).filename().string());
-    };
-
-    // Face corrections and tiles are placed in normalised coordinates, so a
-    // transfer renders a scaled copy as it renders the photo.
-    const cv::Mat shown = previewSide > 0 ? ScaledToLongSide(photo.pixels, previewSide) : photo.pixels;
+    // the command can simply be run again. Face corrections and tiles are
+    // placed in normalised coordinates, so a transfer renders a scaled copy
+    // as it renders the photo.
+    StagingFolder staging(outputs.folder.string());
+    const cv::Mat shown =
+        request.previewSide > 0 ? ScaledToLongSide(photo.pixels, request.previewSide) : photo.pixels;
     if (shown.cols != photo.pixels.cols)
         std::cout << "previews: " << shown.cols << " x " << shown.rows << " (--full for full resolution)\n";
-    std::vector<SheetEntry> sheet;
-    sheet.push_back({MakeThumbnail(shown, kThumbnailSide), "original", stem});
-    ProgressBar bar("suggest");
-    const double share = 1.0 / static_cast<double>(document.transfers.size());
-    for (size_t k = 0; k < document.transfers.size(); ++k) {
-        const TRANSFER& t = document.transfers[k];
-        cv::Mat rendered = shown.clone();
-        RenderInPlace(*api, rendered, t, &bar, share * k, share * (k + 1));
-        MixWithOriginal(shown, rendered, strength);
-        WriteImage(staged(proposalPaths[k]), rendered, false, ImageTagsFor(parsed, photo));
-        sheet.push_back({MakeThumbnail(rendered, kThumbnailSide),
-                         "#" + std::to_string(k) + "  style " + std::to_string(t.styleIndex),
-                         "cluster " + std::to_string(t.clusterIndex) +
-                             (t.faceCorrections.empty()
-                                  ? std::string()
-                                  : ", " + std::to_string(t.faceCorrections.size()) + " face(s) lifted")});
-    }
-    bar.Finish();
+    const std::vector<SheetEntry> sheet =
+        RenderProposals(*api, request, parsed, photo, shown, document, outputs, staging);
+    const std::string heading = fs::path(request.photoPath).filename().string() + "  |  " + faceNote +
+                                "  |  model " + request.modelDir;
+    WriteImage(staging.PathFor("contact-sheet.png"), ComposeContactSheet(heading, sheet, document.faces), false);
+    WriteFileAtomically(staging.PathFor("transfers.json"), SerializeTransfers(document), false);
+    staging.Commit(request.force);
 
-    const std::string heading = fs::path(photoPath).filename().string() + "  |  " + faceNote + "  |  model " + modelDir;
-    WriteImage(staged(sheetPath), ComposeContactSheet(heading, sheet, document.faces), false);
-    WriteFileAtomically(staged(jsonPath), SerializeTransfers(document), false);
-    staging.Commit(force);
     for (size_t k = 0; k < document.transfers.size(); ++k)
         std::cout << "  " << k << "  style " << document.transfers[k].styleIndex << "  cluster "
-                  << document.transfers[k].clusterIndex << "  " << proposalPaths[k] << "\n";
-    std::cout << "contact sheet: " << sheetPath << "\ntransfers: " << jsonPath << "\n";
+                  << document.transfers[k].clusterIndex << "  " << outputs.proposals[k] << "\n";
+    std::cout << "contact sheet: " << outputs.sheet << "\ntransfers: " << outputs.transfers << "\n";
     return kExitOk;
 }
 
