@@ -3,6 +3,7 @@
 #include <sys/wait.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -61,6 +62,26 @@ void CliTest::ExpectRefused(const std::vector<std::string>& args, int status, co
     EXPECT_EQ(std::count(r.err.begin(), r.err.end(), '\n'), 1) << r.err;
     EXPECT_NE(r.err.find(mentions), std::string::npos) << r.err;
     EXPECT_EQ(ListTree(m_work), before);
+}
+
+bool SameBytes(const cv::Mat& a, const cv::Mat& b) {
+    return a.size() == b.size() && a.type() == b.type() && cv::norm(a, b, cv::NORM_INF) == 0.0;
+}
+
+cv::Mat ApplyDirect(const vora_api& api, const cv::Mat& pixels, const TRANSFER& t) {
+    cv::Mat out = pixels.clone();
+    testimages::ImageHandle image(out);
+    EXPECT_EQ(api.apply_transfer(image.get(), t, image.get()), STATUS_OK);
+    return out;
+}
+
+cv::Mat Mixed(const cv::Mat& original, const cv::Mat& restyled, double strength) {
+    cv::Mat out = restyled.clone();
+    for (size_t i = 0; i < out.total() * out.channels(); ++i) {
+        const double o = original.data[i], r = restyled.data[i];
+        out.data[i] = static_cast<uint8_t>(std::floor(o + strength * (r - o) + 0.5));
+    }
+    return out;
 }
 
 }  // namespace clitest

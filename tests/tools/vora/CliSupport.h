@@ -36,6 +36,19 @@ std::set<std::string> ListTree(const std::string& root);
 void WriteRgb(const std::string& path, const cv::Mat& rgbOrGrey);
 cv::Mat ReadRgb(const std::string& path);
 
+// Same size, type and bytes.
+bool SameBytes(const cv::Mat& a, const cv::Mat& b);
+
+// Library result for a whole image, the reference every rendering is held to.
+cv::Mat ApplyDirect(const vora_api& api, const cv::Mat& pixels, const TRANSFER& t);
+
+// What --strength S documents: each colour byte o + S x (r - o), in double,
+// rounded half up.
+cv::Mat Mixed(const cv::Mat& original, const cv::Mat& restyled, double strength);
+
+// The dark oval of SyntheticPhotoRgb, given as the face.
+inline constexpr char kFace[] = "0.3,0.5,0.25,0.55";
+
 // A work folder holding photo.png, removed after the test, and a fixture
 // model with the facade opened on it.
 class CliTest : public ::testing::Test {
