@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <memory>
 #include <random>
-#include <set>
 #include <string>
 #include <utility>
 #include <vector>
@@ -91,23 +90,11 @@ const cv::Mat& SerialReference() {
     return reference;
 }
 
-// Random tilings, in shuffled order, whose fixed cuts cross both face boxes.
+// Random tilings whose cuts cross both face boxes.
 std::vector<std::vector<cv::Rect>> RandomTilings() {
     std::mt19937 random(20240611);
     std::vector<std::vector<cv::Rect>> tilings;
-    for (int tiling = 0; tiling < 3; ++tiling) {
-        std::set<int> xs = {0, 675, 799, 1500}, ys = {0, 349, 410, 1000};
-        for (int i = tiling + 2; i > 0; --i) {
-            xs.insert(1 + random() % 1499);
-            ys.insert(1 + random() % 999);
-        }
-        std::vector<cv::Rect> tiles;
-        for (auto y = ys.begin(); std::next(y) != ys.end(); ++y)
-            for (auto x = xs.begin(); std::next(x) != xs.end(); ++x)
-                tiles.emplace_back(cv::Point(*x, *y), cv::Point(*std::next(x), *std::next(y)));
-        std::shuffle(tiles.begin(), tiles.end(), random);
-        tilings.push_back(tiles);
-    }
+    for (int tiling = 0; tiling < 3; ++tiling) tilings.push_back(testimages::RandomTiling1500x1000(random, tiling + 2));
     return tilings;
 }
 

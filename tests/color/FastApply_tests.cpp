@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <memory>
 #include <random>
-#include <set>
 #include <vector>
 
 #include <tbb/global_control.h>
@@ -85,16 +84,7 @@ TEST(FastApply, TilingsAcrossFacesAndThreadCountsGiveThePlainKernelsBytes) {
         for (const size_t threads : {size_t{1}, size_t{4}}) {
             tbb::global_control limit(tbb::global_control::max_allowed_parallelism, threads);
             EXPECT_EQ(DifferentBytes(Applied(photo, transfer, ApplyKernel::Fastest), reference), 0) << threads;
-            std::set<int> xs = {0, 675, 799, 1500}, ys = {0, 349, 410, 1000};
-            for (int i = 0; i < 3; ++i) {
-                xs.insert(1 + random() % 1499);
-                ys.insert(1 + random() % 999);
-            }
-            std::vector<cv::Rect> tiles;
-            for (auto y = ys.begin(); std::next(y) != ys.end(); ++y)
-                for (auto x = xs.begin(); std::next(x) != xs.end(); ++x)
-                    tiles.emplace_back(cv::Point(*x, *y), cv::Point(*std::next(x), *std::next(y)));
-            std::shuffle(tiles.begin(), tiles.end(), random);
+            const std::vector<cv::Rect> tiles = testimages::RandomTiling1500x1000(random, 3);
             cv::Mat inPlace = photo.clone();
             testing::internal::CaptureStdout();
             for (const cv::Rect& r : tiles) ApplyTransfer(Tile(inPlace, r).get(), transfer, Tile(inPlace, r).get());

@@ -1,6 +1,9 @@
 #include "support/TestImages.h"
 
+#include <algorithm>
 #include <cmath>
+#include <iterator>
+#include <set>
 #include <string>
 
 #include <opencv2/imgproc.hpp>
@@ -61,6 +64,20 @@ ImagePtr Tile(cv::Mat& m, cv::Rect r) {
     const size_t layout[4] = {};
     return ImagePtr(GetTileImageObj(r.height, r.width, m.channels(), layout, m.ptr(r.y, r.x),
                                     CFullResImageSize(m.cols, m.rows), CTopLeftCoordinate(r.x, r.y)));
+}
+
+std::vector<cv::Rect> RandomTiling1500x1000(std::mt19937& random, int extraCuts) {
+    std::set<int> xs = {0, 675, 799, 1500}, ys = {0, 349, 410, 1000};
+    for (int i = 0; i < extraCuts; ++i) {
+        xs.insert(1 + random() % 1499);
+        ys.insert(1 + random() % 999);
+    }
+    std::vector<cv::Rect> tiles;
+    for (auto y = ys.begin(); std::next(y) != ys.end(); ++y)
+        for (auto x = xs.begin(); std::next(x) != xs.end(); ++x)
+            tiles.emplace_back(cv::Point(*x, *y), cv::Point(*std::next(x), *std::next(y)));
+    std::shuffle(tiles.begin(), tiles.end(), random);
+    return tiles;
 }
 
 }  // namespace testimages

@@ -3,6 +3,7 @@
 
 #include <cstdint>
 #include <memory>
+#include <random>
 #include <vector>
 
 #include <opencv2/core.hpp>
@@ -36,6 +37,11 @@ ImagePtr Tile(cv::Mat& m, cv::Rect r);
 
 // True when every field of the two records, the face list included, is bit-identical.
 bool SameRecord(const TRANSFER& a, const TRANSFER& b);
+
+// Tiles covering a 1500 x 1000 image (SyntheticPhotoRgb(1000, 1500)), in
+// shuffled order: cuts at x = 675 and 799 and y = 349 and 410, which cross
+// the face boxes of the colour tests, and `extraCuts` random cuts each way.
+std::vector<cv::Rect> RandomTiling1500x1000(std::mt19937& random, int extraCuts);
 
 }  // namespace testimages
 }  // namespace vora
