@@ -104,9 +104,8 @@ TRANSFER TestTransfer(float low, float high) {
 TEST(ColourKnownAnswers, RgbToLabAndBack) {
     for (const RgbLab& k : kToLab) {
         const LabPixel lab = RgbToLab(k.rgb[0], k.rgb[1], k.rgb[2]);
-        EXPECT_EQ(lab.lightness01, k.lab[0]) << k.rgb[0] << "," << k.rgb[1] << "," << k.rgb[2];
-        EXPECT_EQ(lab.a, k.lab[1]) << k.rgb[0] << "," << k.rgb[1] << "," << k.rgb[2];
-        EXPECT_EQ(lab.b, k.lab[2]) << k.rgb[0] << "," << k.rgb[1] << "," << k.rgb[2];
+        EXPECT_EQ((std::array<float, 3>{lab.lightness01, lab.a, lab.b}), k.lab)
+            << k.rgb[0] << "," << k.rgb[1] << "," << k.rgb[2];
     }
     for (const LabRgb& k : kToRgb) {
         const Rgb8 rgb = LabToRgb(k.lab[0], k.lab[1], k.lab[2]);
@@ -114,28 +113,21 @@ TEST(ColourKnownAnswers, RgbToLabAndBack) {
     }
 }
 
-// Through the library's apply, one pixel per answer, serial and parallel.
+// Through the library's apply, one pixel per answer.
 TEST(ColourKnownAnswers, TransferOfOnePixel) {
     const std::pair<const RgbRgb*, TRANSFER> cases[] = {{kSpread, TestTransfer(0.125f, 0.875f)},
                                                        {kNoSpread, TestTransfer(0.4f, 0.4f)}};
     constexpr size_t kCount = std::size(kSpread);
     static_assert(std::size(kNoSpread) == kCount, "one answer per colour");
     for (const auto& [answers, transfer] : cases) {
-        cv::Mat source(1, kCount, CV_8UC3);
+        cv::Mat in(1, kCount, CV_8UC3), out(1, kCount, CV_8UC3, cv::Scalar::all(7));
         for (size_t i = 0; i < kCount; ++i)
-            source.at<cv::Vec3b>(0, i) = cv::Vec3b(answers[i].in[0], answers[i].in[1], answers[i].in[2]);
-        for (const bool serial : {false, true}) {
-            cv::Mat in = source.clone(), out(source.size(), CV_8UC3, cv::Scalar::all(7));
-            const testimages::ImageHandle inHandle(in), outHandle(out);
-            if (serial)
-                ApplyTransferSerial(inHandle.get(), transfer, outHandle.get());
-            else
-                ApplyTransfer(inHandle.get(), transfer, outHandle.get());
-            for (size_t i = 0; i < kCount; ++i) {
-                const cv::Vec3b got = out.at<cv::Vec3b>(0, i);
-                EXPECT_EQ((std::array<int, 3>{got[0], got[1], got[2]}), answers[i].out)
-                    << answers[i].in[0] << "," << answers[i].in[1] << "," << answers[i].in[2];
-            }
+            in.at<cv::Vec3b>(0, i) = cv::Vec3b(answers[i].in[0], answers[i].in[1], answers[i].in[2]);
+        ApplyTransfer(testimages::ImageHandle(in).get(), transfer, testimages::ImageHandle(out).get());
+        for (size_t i = 0; i < kCount; ++i) {
+            const cv::Vec3b got = out.at<cv::Vec3b>(0, i);
+            EXPECT_EQ((std::array<int, 3>{got[0], got[1], got[2]}), answers[i].out)
+                << answers[i].in[0] << "," << answers[i].in[1] << "," << answers[i].in[2];
         }
     }
 }
