@@ -54,6 +54,12 @@ void WriteBytes(const std::string& path, const std::string& bytes) {
     if (!file.flush()) throw std::runtime_error("cannot write " + path);
 }
 
+std::string ReadBytes(const std::string& path) {
+    std::ostringstream bytes;
+    bytes << std::ifstream(path, std::ios::binary).rdbuf();  // a folder reads as empty
+    return bytes.str();
+}
+
 void TruncateFile(const std::string& path, size_t size) { std::filesystem::resize_file(path, size); }
 
 void WriteDataFile(const std::string& path, const std::vector<int32_t>& header, const std::vector<float>& values) {

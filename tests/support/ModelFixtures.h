@@ -25,6 +25,7 @@ namespace fixtures {
 
 // Throw std::runtime_error on an I/O failure.
 void WriteBytes(const std::string& path, const std::string& bytes);
+std::string ReadBytes(const std::string& path);  // empty when unreadable or a folder
 void TruncateFile(const std::string& path, size_t size);
 // A data file as the readers expect it: int32 header words, then float values.
 void WriteDataFile(const std::string& path, const std::vector<int32_t>& header, const std::vector<float>& values);

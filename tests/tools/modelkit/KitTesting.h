@@ -2,40 +2,25 @@
 
 // Helpers shared by the model kit's tests.
 
-#include <stdlib.h>
-
 #include <filesystem>
-#include <fstream>
-#include <sstream>
-#include <stdexcept>
 #include <string>
 
 #include <gtest/gtest.h>
 #include <opencv2/imgproc.hpp>
 
 #include "modelkit/ModelBuilder.h"
+#include "support/ModelFixtures.h"
 
 namespace kit_testing {
 
 namespace fs = std::filesystem;
 
 // A fresh folder, removed with everything in it at the end of its life.
-struct TempDir {
-    fs::path path;
-    TempDir() {
-        std::string pattern = (fs::temp_directory_path() / "vora_kit_XXXXXX").string();
-        if (!::mkdtemp(&pattern[0])) throw std::runtime_error("cannot make a scratch folder");
-        path = pattern;
-    }
-    ~TempDir() { fs::remove_all(path); }
+struct TempDir : vora::fixtures::TempFolder {
+    const fs::path path{TempFolder::path()};
 };
 
-inline std::string ReadBytes(const fs::path& path) {
-    std::ifstream file(path, std::ios::binary);
-    std::ostringstream out;
-    out << file.rdbuf();
-    return out.str();
-}
+inline std::string ReadBytes(const fs::path& path) { return vora::fixtures::ReadBytes(path.string()); }
 
 // A smooth random colour field, different for each seed.
 inline cv::Mat Scene(int seed, int rows = 96, int cols = 128) {

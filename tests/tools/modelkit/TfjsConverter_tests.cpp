@@ -2,8 +2,8 @@
 // worked out by hand, run through the library's own network loader.
 
 #include <cmath>
-#include <cstring>
 #include <fstream>
+#include <type_traits>
 
 #include <gtest/gtest.h>
 #include <nlohmann/json.hpp>
@@ -22,20 +22,9 @@ using vora::modelkit::ConvertTfjs;
 using vora::modelkit::TfjsConversion;
 namespace fs = std::filesystem;
 
-std::string Base64(const std::string& bytes) {
-    static const char* table = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
-    std::string out;
-    for (size_t i = 0; i < bytes.size(); i += 3) {
-        const size_t n = bytes.size() - i;
-        uint32_t v = uint32_t(uint8_t(bytes[i])) << 16;
-        if (n > 1) v |= uint32_t(uint8_t(bytes[i + 1])) << 8;
-        if (n > 2) v |= uint8_t(bytes[i + 2]);
-        out += table[(v >> 18) & 63];
-        out += table[(v >> 12) & 63];
-        out += n > 1 ? table[(v >> 6) & 63] : '=';
-        out += n > 2 ? table[v & 63] : '=';
-    }
-    return out;
+// Graph attributes hold strings in base64.
+std::string Base64(const std::string& word) {
+    return word == "SAME" ? "U0FNRQ==" : word == "VALID" ? "VkFMSUQ=" : word == "NHWC" ? "TkhXQw==" : "?";
 }
 
 // A TensorFlow.js graph model written as the converter's input.
@@ -47,15 +36,16 @@ public:
         m_nodes.push_back({{"name", name}, {"op", "Placeholder"}, {"attr", {{"shape", {{"shape", {{"dim", shape}}}}}}}});
         return *this;
     }
+    template <typename T>  // float or int32_t
+    Graph& Values(const std::string& name, std::vector<int> shape, const std::vector<T>& values) {
+        const std::string bytes(reinterpret_cast<const char*>(values.data()), values.size() * 4);
+        return Stored(name, shape, std::is_same_v<T, float> ? "float32" : "int32", bytes, json());
+    }
     Graph& Floats(const std::string& name, std::vector<int> shape, const std::vector<float>& values) {
-        std::string bytes(values.size() * 4, '\0');
-        std::memcpy(&bytes[0], values.data(), bytes.size());
-        return Stored(name, shape, "float32", bytes, json());
+        return Values(name, shape, values);
     }
     Graph& Ints(const std::string& name, std::vector<int> shape, const std::vector<int32_t>& values) {
-        std::string bytes(values.size() * 4, '\0');
-        std::memcpy(&bytes[0], values.data(), bytes.size());
-        return Stored(name, shape, "int32", bytes, json());
+        return Values(name, shape, values);
     }
     Graph& Stored(const std::string& name, std::vector<int> shape, const std::string& dtype, const std::string& bytes,
                   const json& quantization) {
@@ -70,14 +60,13 @@ public:
         m_nodes.push_back({{"name", name}, {"op", op}, {"input", inputs}, {"attr", attrs}});
         return *this;
     }
-    // A 4-D convolution filter H, W, in, out.
+    // A 4-D convolution filter H, W, in, out, channels last.
     Graph& Conv(const std::string& name, const std::string& input, std::vector<int> hwio, const std::vector<float>& filter,
-                const std::string& padding = "VALID", int stride = 1, const std::string& format = "NHWC") {
+                const std::string& padding = "VALID", int stride = 1) {
         Floats(name + "/filter", hwio, filter);
-        json strides = format == "NHWC" ? json::array({"1", std::to_string(stride), std::to_string(stride), "1"})
-                                        : json::array({"1", "1", std::to_string(stride), std::to_string(stride)});
+        const json strides = json::array({"1", std::to_string(stride), std::to_string(stride), "1"});
         return Op(name, "Conv2D", {input, name + "/filter"},
-                  {{"padding", {{"s", Base64(padding)}}}, {"data_format", {{"s", Base64(format)}}},
+                  {{"padding", {{"s", Base64(padding)}}}, {"data_format", {{"s", Base64("NHWC")}}},
                    {"strides", {{"list", {{"i", strides}}}}}});
     }
     Graph& Transpose(const std::string& name, const std::string& input, std::vector<int32_t> perm) {

@@ -27,8 +27,8 @@ TEST_F(CliTest, BatchRendersAsApplyDoesSkipsWhatExistsAndReportsFailures) {
     EXPECT_EQ(first.status, 1);
     EXPECT_NE(first.out.find("2 done, 0 skipped, 1 failed"), std::string::npos) << first.out;
     EXPECT_EQ(first.err, "vora: broken.jpg: cannot read image (not a JPEG, PNG, TIFF or WebP file, or damaged)\n");
-    EXPECT_EQ(Slurp(m_work + "/out/photo.png"), Slurp(m_work + "/one.png"));
-    EXPECT_EQ(Slurp(m_work + "/out/b.jpg"), Slurp(m_work + "/one.jpg"));
+    EXPECT_EQ(ReadBytes(m_work + "/out/photo.png"), ReadBytes(m_work + "/one.png"));
+    EXPECT_EQ(ReadBytes(m_work + "/out/b.jpg"), ReadBytes(m_work + "/one.jpg"));
 
     const RunResult again = Run(batch);
     EXPECT_EQ(again.status, 1);

@@ -26,7 +26,7 @@ TEST_F(CliTest, BuildModelIsDeterministicAndItsModelWorks) {
     const std::set<std::string> files = ListTree(m_work + "/a");
     EXPECT_EQ(files.size(), 7u);  // four data files, the net folder and its two files: no staging left behind
     EXPECT_EQ(ListTree(m_work + "/b"), files);
-    for (const std::string& name : files) EXPECT_EQ(Slurp(m_work + "/a/" + name), Slurp(m_work + "/b/" + name)) << name;
+    for (const std::string& name : files) EXPECT_EQ(ReadBytes(m_work + "/a/" + name), ReadBytes(m_work + "/b/" + name)) << name;
     EXPECT_EQ(Run({"inspect", "a"}).status, 0);
     EXPECT_EQ(Run({"suggest", "photo.png", "--model", "a", "-n", "2", "--faces", "none"}).status, 0);
 
@@ -40,7 +40,7 @@ TEST_F(CliTest, BuildModelIsDeterministicAndItsModelWorks) {
                   "999 clusters");
     const RunResult forced = Run({"build-model", "--styles", "styles", "--out", "a", "--clusters", "2", "--force"});
     EXPECT_EQ(forced.status, 0) << forced.err;
-    EXPECT_NE(Slurp(m_work + "/a/" + vora::kClusterFileName), Slurp(m_work + "/b/" + vora::kClusterFileName));
+    EXPECT_NE(ReadBytes(m_work + "/a/" + vora::kClusterFileName), ReadBytes(m_work + "/b/" + vora::kClusterFileName));
 }
 
 // Without the detector's files the default is the scene descriptor, with a
@@ -57,7 +57,7 @@ TEST_F(CliTest, BuildModelChoosesItsNetworkAndSaysHowToFetchTheDetector) {
     ::unsetenv("VORA_NETWORK_DIR");
     EXPECT_EQ(byDefault.status, 0) << byDefault.err;
     EXPECT_NE(byDefault.err.find("bash scripts/fetch-network.sh"), std::string::npos) << byDefault.err;
-    EXPECT_NE(Slurp(m_work + "/a/net/deploy2.prototxt").find("vora_scene_descriptor"), std::string::npos);
+    EXPECT_NE(ReadBytes(m_work + "/a/net/deploy2.prototxt").find("vora_scene_descriptor"), std::string::npos);
 
     ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--network", "imagenet"}, 2, "nanodet or scene");
     ExpectRefused({"build-model", "--styles", "styles", "--out", "b", "--feature", "x"}, 2, "--feature goes with --tfjs");

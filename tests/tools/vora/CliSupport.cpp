@@ -6,8 +6,6 @@
 #include <cmath>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
-#include <sstream>
 
 #include <opencv2/imgcodecs.hpp>
 #include <opencv2/imgproc.hpp>
@@ -17,21 +15,14 @@ namespace clitest {
 
 namespace fs = std::filesystem;
 
-std::string Slurp(const std::string& path) {
-    std::ifstream in(path, std::ios::binary);
-    std::ostringstream s;
-    s << in.rdbuf();
-    return s.str();
-}
-
 RunResult RunVora(const std::string& cwd, const std::vector<std::string>& args) {
     static const fixtures::TempFolder folder;
     const std::string& capture = folder.path();
     std::string command = "cd '" + cwd + "' && exec env -u VORA_MODEL '" VORA_CLI_PATH "'";
     for (const std::string& a : args) command += " '" + a + "'";  // no test argument holds a quote
     const int status = std::system((command + " >" + capture + "/out 2>" + capture + "/err").c_str());
-    return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status), Slurp(capture + "/out"),
-            Slurp(capture + "/err")};
+    return {WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status), ReadBytes(capture + "/out"),
+            ReadBytes(capture + "/err")};
 }
 
 std::set<std::string> ListTree(const std::string& root) {

@@ -23,7 +23,7 @@ struct RunResult {
     std::string err;
 };
 
-std::string Slurp(const std::string& path);
+using fixtures::ReadBytes;
 
 // Runs the tool in folder cwd without $VORA_MODEL; its output is captured
 // outside that folder so that the folder holds only what the tool wrote.

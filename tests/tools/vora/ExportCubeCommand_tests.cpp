@@ -67,7 +67,7 @@ TEST_F(CliTest, CubeHoldsTheToolsOwnColoursAtItsLatticePoints) {
                   0);
         int declared = 0;
         std::vector<cv::Vec3d> domain, values;
-        std::istringstream in(Slurp(m_work + "/" + name));
+        std::istringstream in(ReadBytes(m_work + "/" + name));
         for (std::string line, key; std::getline(in, line);) {
             std::istringstream words(line);
             cv::Vec3d v;

@@ -2,7 +2,6 @@
 // sets that appear whole or not at all.
 
 #include <filesystem>
-#include <fstream>
 #include <iterator>
 #include <string>
 
@@ -18,11 +17,6 @@ namespace {
 namespace fs = std::filesystem;
 using namespace vora::clitest;
 
-std::string Contents(const std::string& path) {
-    std::ifstream file(path, std::ios::binary);
-    return std::string(std::istreambuf_iterator<char>(file), {});
-}
-
 size_t Entries(const std::string& folder) {
     return static_cast<size_t>(std::distance(fs::directory_iterator(folder), fs::directory_iterator()));
 }
@@ -35,10 +29,10 @@ TEST(OutputFiles, TheFinalStepReplacesOnlyWhenAllowed) {
     vora::fixtures::WriteBytes(path, "the user's");
     EXPECT_THAT([&] { vora::cli::WriteFileAtomically(path, "ours", false); },
                 testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("already exists")));
-    EXPECT_EQ(Contents(path), "the user's");
+    EXPECT_EQ(ReadBytes(path), "the user's");
     EXPECT_EQ(Entries(folder), 1u);  // no temporary left
     vora::cli::WriteFileAtomically(path, "ours", true);
-    EXPECT_EQ(Contents(path), "ours");
+    EXPECT_EQ(ReadBytes(path), "ours");
 }
 
 // A set appears whole or not at all: in a new folder by one rename, in an
@@ -58,7 +52,7 @@ TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
         vora::cli::WriteFileAtomically(staging.PathFor("b.txt"), "b", false);
         staging.Commit(false);
     }
-    EXPECT_TRUE(Contents(out + "/a.txt") == "a" && Contents(out + "/b.txt") == "b" && Entries(root) == 1u);
+    EXPECT_TRUE(ReadBytes(out + "/a.txt") == "a" && ReadBytes(out + "/b.txt") == "b" && Entries(root) == 1u);
     fs::remove(out + "/a.txt");
     {
         vora::cli::StagingFolder staging(out);
@@ -67,19 +61,19 @@ TEST(OutputFiles, StagedSetsAppearTogetherOrNotAtAll) {
         EXPECT_THAT([&] { staging.Commit(false); },
                     testing::ThrowsMessage<vora::cli::Failure>(testing::HasSubstr("nothing was written")));
     }
-    EXPECT_TRUE(!fs::exists(out + "/a.txt") && Contents(out + "/b.txt") == "b" && Entries(root) == 1u);
+    EXPECT_TRUE(!fs::exists(out + "/a.txt") && ReadBytes(out + "/b.txt") == "b" && Entries(root) == 1u);
     {
         vora::cli::StagingFolder staging(out);
         vora::cli::WriteFileAtomically(staging.PathFor("b.txt"), "new b", false);
         staging.Commit(true);
     }
-    EXPECT_TRUE(Contents(out + "/b.txt") == "new b" && Entries(out) == 1u && Entries(root) == 1u);
+    EXPECT_TRUE(ReadBytes(out + "/b.txt") == "new b" && Entries(out) == 1u && Entries(root) == 1u);
     {
         vora::cli::StagingFolder staging(root + "/new/deeper/set");  // parents made as needed
         vora::cli::WriteFileAtomically(staging.PathFor("c.txt"), "c", false);
         staging.Commit(false);
     }
-    EXPECT_EQ(Contents(root + "/new/deeper/set/c.txt"), "c");
+    EXPECT_EQ(ReadBytes(root + "/new/deeper/set/c.txt"), "c");
 }
 
 }  // namespace
