@@ -2,7 +2,6 @@
 // writes nothing, whichever form of the interface the caller uses.
 #include <gtest/gtest.h>
 
-#include <chrono>
 #include <iterator>
 #include <utility>
 #include <vector>
@@ -62,7 +61,6 @@ TEST_F(ArgumentChecks, ComputeRefusesMissingArgumentsShortRoomAndNoRequest) {
 
 // A model missing any data file, or with its scores transposed, cannot rank styles.
 TEST_F(ArgumentChecks, ComputeRefusesModelsThatCannotRankStyles) {
-    const auto started = std::chrono::steady_clock::now();
     for (bool FixtureOptions::*flag : {&FixtureOptions::writeClusters, &FixtureOptions::writeStyles,
                                        &FixtureOptions::writeScores, &FixtureOptions::writeDistances,
                                        &FixtureOptions::transposeScores}) {
@@ -71,7 +69,6 @@ TEST_F(ArgumentChecks, ComputeRefusesModelsThatCannotRankStyles) {
         EXPECT_EQ(Compute(broken), STATUS_MODEL_INCOMPLETE);
     }
     EXPECT_EQ(Compute(fixtures::RandomDatabase(0, 0)), STATUS_MODEL_INCOMPLETE);
-    EXPECT_LT(std::chrono::steady_clock::now() - started, std::chrono::seconds(20));
 }
 
 // Refused geometry writes and prints nothing; an empty source is no error and writes nothing either.

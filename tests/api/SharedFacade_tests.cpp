@@ -8,8 +8,10 @@
 // four threads of the test are then the only ones, all instrumented.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <atomic>
 #include <cstring>
+#include <functional>
 #include <memory>
 #include <thread>
 #include <vector>
@@ -36,13 +38,6 @@ namespace {
 using testimages::ImageHandle;
 using testimages::SameRecord;
 
-struct Results {
-    std::vector<TRANSFER> proposals;
-    TRANSFER towardImage;
-    TRANSFER towardStyle;
-    cv::Mat applied;
-};
-
 TEST(SharedFacade, FourThreadsGiveTheSerialResults) {
 #ifdef VORA_UNDER_TSAN
     tbb::global_control oneThread(tbb::global_control::max_allowed_parallelism, 1);
@@ -50,7 +45,6 @@ TEST(SharedFacade, FourThreadsGiveTheSerialResults) {
 #endif
     const fixtures::ModelFixture model(fixtures::RandomDatabase(4, 16));
     const vora_api api(model.modelDir());
-
     cv::Mat photo = testimages::SyntheticPhotoRgb(192, 256, 3);  // large enough for the colour cache
     cv::Mat look = testimages::SyntheticPhotoRgb(64, 80, 11);
     const ImageHandle content(photo), style(look);
@@ -61,58 +55,46 @@ TEST(SharedFacade, FourThreadsGiveTheSerialResults) {
     params.numTransfers = 3;
     params.finishFactor = 2.0f;  // a target lightness of 1: the face is always corrected
 
-    // One pass of every operation; `apply` uses the first proposal of a serial
-    // run, so that its input does not depend on the other threads.
-    auto computeAll = [&](Results& r) {
-        r.proposals.assign(3, TRANSFER{});
-        ASSERT_EQ(api.compute_transfers(content.get(), r.proposals, params), STATUS_OK);
+    // Each operation once, serially; apply renders the first serial proposal,
+    // so that its input does not depend on the other threads.
+    std::vector<TRANSFER> proposals(3);
+    TRANSFER towardImage, towardStyle;
+    ASSERT_EQ(api.compute_transfers(content.get(), proposals, params), STATUS_OK);
+    ASSERT_EQ(api.compute_transfer(content.get(), style.get(), towardImage, params), STATUS_OK);
+    ASSERT_EQ(api.compute_transfer(content.get(), 5, towardStyle, params), STATUS_OK);
+    ASSERT_FALSE(proposals[0].faceCorrections.empty());  // apply's face path is exercised
+    const auto render = [&](cv::Mat target) {
+        const ImageHandle out(target);
+        return api.apply_transfer(content.get(), proposals[0], out.get()) == STATUS_OK ? target : cv::Mat();
     };
-    Results serial;
-    computeAll(serial);
-    ASSERT_EQ(api.compute_transfer(content.get(), style.get(), serial.towardImage, params), STATUS_OK);
-    ASSERT_EQ(api.compute_transfer(content.get(), 5, serial.towardStyle, params), STATUS_OK);
-    ASSERT_FALSE(serial.proposals[0].faceCorrections.empty());  // apply's face path is exercised
-    serial.applied = photo.clone();
-    {
-        const ImageHandle out(serial.applied);
-        ASSERT_EQ(api.apply_transfer(content.get(), serial.proposals[0], out.get()), STATUS_OK);
-    }
+    const cv::Mat applied = render(cv::Mat(photo.size(), photo.type(), cv::Scalar::all(0)));
 
-    constexpr int kRounds = 3;
+    // Whether one more run of each operation gives the serial result; only
+    // the first thread runs compute_transfers.
+    const std::function<bool()> operations[] = {
+        [&] {
+            std::vector<TRANSFER> again(3);
+            return api.compute_transfers(content.get(), again, params) == STATUS_OK &&
+                   std::equal(again.begin(), again.end(), proposals.begin(), SameRecord);
+        },
+        [&] {
+            TRANSFER t;
+            return api.compute_transfer(content.get(), style.get(), t, params) == STATUS_OK && SameRecord(t, towardImage);
+        },
+        [&] {
+            TRANSFER t;
+            return api.compute_transfer(content.get(), 5, t, params) == STATUS_OK && SameRecord(t, towardStyle);
+        },
+        [&] {  // into its own image, reading the shared content
+            const cv::Mat target = render(cv::Mat(photo.size(), photo.type(), cv::Scalar::all(0)));
+            return !target.empty() && std::memcmp(target.data, applied.data, target.total() * 3) == 0;
+        }};
     std::atomic<int> mismatches{0};
     std::vector<std::thread> threads;
-    threads.emplace_back([&] {  // the only thread that runs compute_transfers
-        for (int i = 0; i < kRounds; ++i) {
-            Results r;
-            computeAll(r);
-            for (size_t k = 0; k < r.proposals.size(); ++k)
-                if (!SameRecord(r.proposals[k], serial.proposals[k])) ++mismatches;
-        }
-    });
-    threads.emplace_back([&] {
-        for (int i = 0; i < kRounds; ++i) {
-            TRANSFER t;
-            if (api.compute_transfer(content.get(), style.get(), t, params) != STATUS_OK ||
-                !SameRecord(t, serial.towardImage))
-                ++mismatches;
-        }
-    });
-    threads.emplace_back([&] {
-        for (int i = 0; i < kRounds; ++i) {
-            TRANSFER t;
-            if (api.compute_transfer(content.get(), 5, t, params) != STATUS_OK || !SameRecord(t, serial.towardStyle))
-                ++mismatches;
-        }
-    });
-    threads.emplace_back([&] {  // apply into its own image, reading the shared content
-        for (int i = 0; i < kRounds; ++i) {
-            cv::Mat target(photo.size(), photo.type(), cv::Scalar::all(0));
-            const ImageHandle out(target);
-            if (api.apply_transfer(content.get(), serial.proposals[0], out.get()) != STATUS_OK ||
-                std::memcmp(target.data, serial.applied.data, target.total() * target.elemSize()) != 0)
-                ++mismatches;
-        }
-    });
+    for (const auto& operation : operations)
+        threads.emplace_back([&mismatches, operation] {
+            for (int round = 0; round < 3; ++round) mismatches += operation() ? 0 : 1;
+        });
     for (std::thread& t : threads) t.join();
     EXPECT_EQ(mismatches.load(), 0);
 }

@@ -96,14 +96,6 @@ TEST_F(VoraApi, ExampleHostAndDefaultConstructorGiveTheSameBytes) {
     EXPECT_EQ(cv::norm(cv::imread(outPath, cv::IMREAD_COLOR), bgr, cv::NORM_INF), 0.0);
 }
 
-// A count of faces without an array means no faces.
-TEST_F(VoraApi, AFaceCountWithoutAnArrayMeansNoFaces) {
-    TRANSFER records[5];
-    params.numFaceRects = 3;
-    ASSERT_EQ(Api(options).compute_transfers(content.get(), records, params), STATUS_OK);
-    for (const TRANSFER& t : records) EXPECT_TRUE(t.faceCorrections.empty());
-}
-
 TEST_F(VoraApi, BrokenNetworkFilesAreRefusedAtConstruction) {
     // Broken network files throw out of the constructor as the libraries' own
     // exceptions; the sanitizer build checks for leaks.
@@ -114,18 +106,15 @@ TEST_F(VoraApi, BrokenNetworkFilesAreRefusedAtConstruction) {
         EXPECT_THROW(vora_api{broken.modelDir()}, cv::Exception);
         EXPECT_THROW(CreateVoraObj(broken.modelDir().c_str()), cv::Exception);
     }
-    // An empty weights file, or a directory in its place, is refused by the
+    // An empty weights file, or a folder in its place, is refused by the
     // constructor too, not by the first compute.
     options.network.files = Files::Valid;
-    for (const bool directory : {false, true}) {
+    for (const bool folder : {false, true}) {
         const ModelFixture broken(options);
         const std::string weights = broken.modelDir() + kNetworkFolder + kNetworkWeightsName;
         std::filesystem::remove(weights);
-        if (directory)
-            std::filesystem::create_directory(weights);
-        else
-            fixtures::WriteBytes(weights, "");
-        EXPECT_THROW(vora_api{broken.modelDir()}, cv::Exception) << directory;
+        folder ? void(std::filesystem::create_directory(weights)) : fixtures::WriteBytes(weights, "");
+        EXPECT_THROW(vora_api{broken.modelDir()}, cv::Exception) << folder;
     }
 }
 

@@ -34,18 +34,6 @@ ColourStats StatsOfLightness(std::vector<float> lightness, int rows) {
     return StatsOf(lab);
 }
 
-TEST(ConvertToLab, EveryPixelInByteOrderThroughTheRowStride) {
-    cv::Mat wide(7, 11, CV_8UC3), lab(4, 5, CV_32FC3);
-    cv::randu(wide, cv::Scalar::all(0), cv::Scalar::all(256));
-    const cv::Mat view = wide(cv::Rect(3, 2, 5, 4));  // rows lie further apart than 5 x 3 bytes
-    ConvertToLab(view, lab);
-    for (int i = 0; i < 20; ++i) {
-        const cv::Vec3b bgr = view.at<cv::Vec3b>(i / 5, i % 5);
-        const LabPixel e = RgbToLab(bgr[2], bgr[1], bgr[0]);
-        ASSERT_EQ(lab.at<cv::Vec3f>(i / 5, i % 5), cv::Vec3f(e.lightness01, e.a, e.b)) << i;
-    }
-}
-
 TEST(ColourStatistics, FlatImagesStayInsideTheArray) {
     // 0/0 normalises every value to 0, and the first sample index would be N.
     for (const cv::Size size : {cv::Size(1, 1), cv::Size(40, 30)}) {

@@ -211,29 +211,6 @@ TEST(TfjsConverter, DecodesHalfAndAffineWeightsExactly) {
     EXPECT_EQ(files.weights[2].blobs[1].data, (std::vector<float>{0.5f, 4.5f}));
 }
 
-// Only the feature's ancestors are written: a detection head hanging off the
-// feature, with an op the converter does not know, is left out, and the
-// feature is the network's one output.
-TEST(TfjsConverter, WritesOnlyTheFeaturesAncestors) {
-    TempDir dir;
-    Graph g;
-    g.Input("image", {1, 416, 416, 3})
-        .Conv("backbone", "image", {1, 1, 3, 2}, {1, 0, 0, 1, 0, 0})
-        .Op("activated", "LeakyRelu", {"backbone"}, {{"alpha", {{"f", 0.1}}}})
-        .Conv("head", "activated", {1, 1, 2, 2}, {1, 0, 0, 1})
-        .Op("scores", "Sigmoid", {"head"})
-        .Conv("unused", "image", {1, 1, 3, 1}, {1, 1, 1});
-    const vora::modelkit::NetworkFiles files = ConvertTfjs(Options(g.Write(dir.path), "activated", 2));
-    EXPECT_EQ(files.definition.find("head"), std::string::npos);
-    EXPECT_EQ(files.definition.find("unused"), std::string::npos);
-    // B = 10 - 0 and G = 20 - 0 (no normalisation), one of them made negative
-    // by the mean: (10 - 30) x 0.1 = -2.
-    TfjsConversion options = Options(g.Write(dir.path), "activated", 2);
-    options.rgbInput = false;
-    options.mean = {{30, 0, 0}};
-    EXPECT_EQ(FeatureOfFlatPhoto(ConvertTfjs(options), cv::Scalar(10, 20, 40)), (std::vector<float>{-2.0f, 20.0f}));
-}
-
 // TF's SAME padding on an even size is 0 before and 1 after for a 3 x 3
 // stride-2 window, and TF pooling rounds its size down where the network
 // format rounds up: both are refused at the crop where they occur, and the
