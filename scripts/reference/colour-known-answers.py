@@ -5,7 +5,7 @@ Every float operation of the per-pixel conversion and transfer is replayed in
 Python: double arithmetic is Python's own, and each float operation is done
 in double and rounded to float (exact for +, -, *, / since double holds more
 than twice float's precision). The tables are rebuilt from their formulas.
-Prints C++ initialisers with hex floats for tests/color/KnownAnswers_tests.cpp.
+Prints C++ initialisers with hex floats for tests/color/ColourKnownAnswers_tests.cpp.
 """
 import math
 import struct

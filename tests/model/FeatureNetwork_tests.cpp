@@ -147,29 +147,27 @@ TEST(FeatureNetwork, FixtureNetworkGivesTheHandComputedFeature) {
 }
 
 TEST(FeatureNetwork, ReadsMeanBlobsInTheLegacyLayout) {
-    // num/channels/height/width fields (one varint byte each) and unpacked floats; the fixture
-    // network's mean file covers the shaped layout.
+    // num/channels/height/width fields (one varint byte each), then the values
+    // unpacked or packed; the fixture network's mean file covers the shaped layout.
     TempNetwork files;
     std::vector<float> values(2 * 3 * 4);
     std::iota(values.begin(), values.end(), 0.5f);
-    std::string legacy = {8, 1, 16, 2, 24, 3, 32, 4};
-    for (float value : values) legacy += '\x2d' + std::string(reinterpret_cast<const char*>(&value), 4);
-    fixtures::WriteBytes(files.folder + "mean", legacy);
-    EXPECT_TRUE(SameFloats(ReadMeanBlob(files.folder + "mean", 2, 3, 4), values.data(), values.size()));
-    EXPECT_THROW(ReadMeanBlob(files.folder + "mean", 3, 3, 4), cv::Exception);  // another size
-    fixtures::WriteBytes(files.folder + "short", legacy.substr(0, 8 + 5));
-    EXPECT_THROW(ReadMeanBlob(files.folder + "short", 2, 3, 4), cv::Exception);
+    const std::string raw(reinterpret_cast<const char*>(values.data()), 4 * values.size());
+    std::string unpacked = {8, 1, 16, 2, 24, 3, 32, 4}, packed = unpacked + '\x2a' + char(raw.size()) + raw;
+    for (size_t i = 0; i < raw.size(); i += 4) unpacked += '\x2d' + raw.substr(i, 4);
+    const auto read = [&files](const std::string& bytes, int channels = 2) {
+        fixtures::WriteBytes(files.folder + "mean", bytes);
+        return ReadMeanBlob(files.folder + "mean", channels, 3, 4);
+    };
+    EXPECT_TRUE(SameFloats(read(unpacked), values.data(), values.size()));
+    EXPECT_TRUE(SameFloats(read(packed), values.data(), values.size()));
+    EXPECT_THROW(read(unpacked, 3), cv::Exception);  // another size
+    EXPECT_THROW(read(unpacked.substr(0, 13)), cv::Exception);
     EXPECT_THROW(ReadMeanBlob(files.folder + "absent", 2, 3, 4), cv::Exception);
     // Cut in the middle of the last value, unpacked and packed: refused, not read as 0.
-    fixtures::WriteBytes(files.folder + "cut", legacy.substr(0, legacy.size() - 2));
-    EXPECT_THROW(ReadMeanBlob(files.folder + "cut", 2, 3, 4), cv::Exception);
-    std::string packed = {8, 1, 16, 2, 24, 3, 32, 4, '\x2a', static_cast<char>(4 * values.size())};
-    packed += std::string(reinterpret_cast<const char*>(values.data()), 4 * values.size());
-    fixtures::WriteBytes(files.folder + "packed", packed);
-    EXPECT_TRUE(SameFloats(ReadMeanBlob(files.folder + "packed", 2, 3, 4), values.data(), values.size()));
-    packed[9] = static_cast<char>(4 * values.size() - 2);  // the length itself cuts the last value
-    fixtures::WriteBytes(files.folder + "packed-cut", packed.substr(0, packed.size() - 2));
-    EXPECT_THROW(ReadMeanBlob(files.folder + "packed-cut", 2, 3, 4), cv::Exception);
+    EXPECT_THROW(read(unpacked.substr(0, unpacked.size() - 2)), cv::Exception);
+    packed[9] = static_cast<char>(raw.size() - 2);  // the length itself cuts the last value
+    EXPECT_THROW(read(packed.substr(0, packed.size() - 2)), cv::Exception);
 }
 
 }  // namespace

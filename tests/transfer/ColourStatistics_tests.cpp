@@ -140,17 +140,5 @@ TEST(ColourStatistics, SummaryOfPixelsEqualsTheLabImageStatisticsBitForBit) {
     }
 }
 
-TEST(MatrixSqrt, SquaresBackToTheRandomSymmetricPositiveInput) {
-    cv::RNG rng(11);
-    for (int trial = 0; trial < 20; ++trial) {
-        cv::Mat m(2, 2, CV_32F), root;
-        rng.fill(m, cv::RNG::UNIFORM, -30.0f, 30.0f);
-        const cv::Mat spd = m * m.t() + cv::Mat::eye(2, 2, CV_32F);
-        MatrixSqrt(spd, root);
-        EXPECT_TRUE(cv::determinant(root) > 0 && cv::trace(root)[0] > 0) << root;  // the principal root
-        EXPECT_LE(cv::norm(root * root, spd, cv::NORM_INF), 1e-4 * cv::norm(spd, cv::NORM_INF)) << spd;
-    }
-}
-
 }  // namespace
 }  // namespace vora
