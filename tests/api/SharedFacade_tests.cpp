@@ -79,7 +79,8 @@ TEST(SharedFacade, FourThreadsGiveTheSerialResults) {
         },
         [&] {
             TRANSFER t;
-            return api.compute_transfer(content.get(), style.get(), t, params) == STATUS_OK && SameRecord(t, towardImage);
+            return api.compute_transfer(content.get(), style.get(), t, params) == STATUS_OK &&
+                   SameRecord(t, towardImage);
         },
         [&] {
             TRANSFER t;

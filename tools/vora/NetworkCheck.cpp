@@ -2,6 +2,7 @@
 
 #include <memory>
 #include <new>
+#include <string>
 #include <vector>
 
 #include <opencv2/core.hpp>
@@ -32,52 +33,49 @@ cv::Mat TestPicture() {
     return rgb;
 }
 
+// Runs step; a failure of the libraries becomes a problem of the model,
+// worded "<what>: <reason>", and false. Running out of memory is the
+// machine's problem, not the model's: it goes on to the command's handler.
+template <typename Step>
+bool Succeeds(ModelExamination& model, const std::string& what, Step&& step) {
+    try {
+        step();
+        return true;
+    } catch (const cv::Exception& e) {
+        model.problems.push_back(what + ": " + e.err);
+    } catch (const std::bad_alloc&) {
+        throw;
+    } catch (const std::exception& e) {
+        model.problems.push_back(what + ": " + e.what());
+    }
+    return false;
+}
+
 }  // namespace
 
 std::string CheckModelNetwork(ModelExamination& model) {
     if (!model.definition.present || !model.weights.present) return "network: not loaded (files missing)";
+    const std::string notLoading = "the network does not load";
     if (model.broken()) {
         // The facade would read the broken data files too; the network alone
         // tells whether it loads.
-        try {
-            (void)FeatureNetwork::Load(model.definition.path, model.weights.path);
-        } catch (const cv::Exception& e) {
-            model.problems.push_back("the network does not load: " + e.err);
-            return "network: does not load";
-        } catch (const std::bad_alloc&) {
-            throw;
-        } catch (const std::exception& e) {
-            model.problems.push_back(std::string("the network does not load: ") + e.what());
-            return "network: does not load";
-        }
+        const auto load = [&model] { (void)FeatureNetwork::Load(model.definition.path, model.weights.path); };
+        if (!Succeeds(model, notLoading, load)) return "network: does not load";
         return "network: loads (no test computation: the data files are broken)";
     }
     std::unique_ptr<vora_api> api;
-    try {
-        api = std::make_unique<vora_api>(WithTrailingSlash(model.dir));
-    } catch (const cv::Exception& e) {
-        model.problems.push_back("the network does not load: " + e.err);
+    if (!Succeeds(model, notLoading, [&] { api = std::make_unique<vora_api>(WithTrailingSlash(model.dir)); }))
         return "network: does not load";
-    } catch (const std::exception& e) {
-        model.problems.push_back(std::string("the network does not load: ") + e.what());
-        return "network: does not load";
-    }
 
     cv::Mat rgb = TestPicture();
     ImageHandle image = WrapWholeImage(rgb);
     VoraParameters params;
     params.numTransfers = 1;
     std::vector<TRANSFER> out(1);
-    Status status;
-    try {
-        status = api->compute_transfers(image.get(), out, params);
-    } catch (const cv::Exception& e) {
-        model.problems.push_back("the network fails on a test picture: " + e.err);
+    Status status = STATUS_OK;
+    if (!Succeeds(model, "the network fails on a test picture",
+                  [&] { status = api->compute_transfers(image.get(), out, params); }))
         return "network: loads, but fails on a test picture";
-    } catch (const std::exception& e) {
-        model.problems.push_back(std::string("the network fails on a test picture: ") + e.what());
-        return "network: loads, but fails on a test picture";
-    }
     if (status == STATUS_MODEL_INCOMPLETE) {
         // The data files were found complete and in agreement above, so the
         // library's "incomplete" can only mean a short feature.

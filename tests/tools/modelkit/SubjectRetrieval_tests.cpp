@@ -62,6 +62,7 @@ TEST(SubjectRetrieval, SubFoldersNameTheSubjects) {
     const std::vector<LabelledPhoto> photos = ListLabelledPhotos(dir.path.string());
     ASSERT_EQ(photos.size(), 3u);
     std::string listed;
-    for (const LabelledPhoto& photo : photos) listed += photo.subject + "/" + fs::path(photo.path).filename().string() + " ";
+    for (const LabelledPhoto& photo : photos)
+        listed += photo.subject + "/" + fs::path(photo.path).filename().string() + " ";
     EXPECT_EQ(listed, "people/z.png water/a.jpg water/b.png ");
 }
