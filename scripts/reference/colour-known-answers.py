@@ -104,14 +104,13 @@ COLOURS = [(0, 0, 0), (255, 255, 255), (255, 0, 0), (0, 255, 0), (0, 0, 255), (2
 LAB_INPUTS = [(0.5, 60.0, -40.0), (0.25, -30.5, 45.25), (0.9, 12.0, 80.0), (0.05, 3.0, -3.0),
               (0.7, -70.0, -20.0), (1.0, 0.0, 0.0), (0.0, 0.0, 0.0), (0.6, 100.0, 100.0)]
 
-print("// rgb -> (L/100, a, b)")
+SPREAD = (f32(0.125), f32(0.875))
+NO_SPREAD = (f32(0.4), f32(0.4))
+print("// rgb, (L/100, a, b), transfer with low 0.125 high 0.875, transfer with low = high = 0.4")
 for c in COLOURS:
     l, a, b = rgb_to_lab(*c)
-    print("    {{%d, %d, %d}, {%s, %s, %s}}," % (c + (float.hex(l), float.hex(a), float.hex(b))))
+    print("    {{%d, %d, %d}, {%s, %s, %s}, {%d, %d, %d}, {%d, %d, %d}}," %
+          (c + (float.hex(l), float.hex(a), float.hex(b)) + transfer(*c, *SPREAD) + transfer(*c, *NO_SPREAD)))
 print("// (L/100, a, b) -> rgb")
 for lab in LAB_INPUTS:
     print("    {{%s, %s, %s}, {%d, %d, %d}}," % (tuple(float.hex(f32(v)) for v in lab) + lab_to_rgb(*map(f32, lab))))
-for low, high in ((f32(0.125), f32(0.875)), (f32(0.4), f32(0.4))):
-    print("// transfer, low %s high %s" % (float.hex(low), float.hex(high)))
-    for c in COLOURS:
-        print("    {{%d, %d, %d}, {%d, %d, %d}}," % (c + transfer(*c, low, high)))

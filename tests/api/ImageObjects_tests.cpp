@@ -65,12 +65,7 @@ TEST(ImageObjects, GeometryStridesReferenceCountsAndReleasing) {
 // Area counts pixels of an inclusive rectangle and does not look at
 // emptiness; Empty is true only for strictly inverted sides (NaN never).
 TEST(ImageObjects, DoubleRectAreaAndEmptinessAtTheirEdges) {
-    struct Case {
-        CDoubleRect rect;
-        double area;
-        bool empty;
-    };
-    const Case cases[] = {
+    const std::tuple<CDoubleRect, double, bool> cases[] = {  // rectangle, area, empty
         {CDoubleRect(), 1.0, false},                     // one pixel at the origin
         {CDoubleRect(2, 2, 3, 3), 1.0, false},           // a point
         {CDoubleRect(0, 9, 0, 4), 50.0, false},          // 10 x 5
@@ -79,10 +74,9 @@ TEST(ImageObjects, DoubleRectAreaAndEmptinessAtTheirEdges) {
         {CDoubleRect(0, 9, 4, 0), -30.0, true},          // one inverted: negative
         {CDoubleRect(0.5, 1.0, 0, 0), 1.5, false},       // fractional sides
     };
-    for (const Case& c : cases) {
-        SCOPED_TRACE(testing::Message() << c.rect.left << " " << c.rect.right << " " << c.rect.top << " " << c.rect.bottom);
-        EXPECT_EQ(c.rect.Area(), c.area);
-        EXPECT_EQ(c.rect.Empty(), c.empty);
+    for (const auto& [rect, area, empty] : cases) {
+        SCOPED_TRACE(testing::Message() << rect.left << " " << rect.right << " " << rect.top << " " << rect.bottom);
+        EXPECT_TRUE(rect.Area() == area && rect.Empty() == empty);
     }
     const CDoubleRect nan(std::nan(""), 1, 0, 1);
     EXPECT_FALSE(nan.Empty());

@@ -12,7 +12,6 @@
 #include <atomic>
 #include <cstring>
 #include <functional>
-#include <memory>
 #include <thread>
 #include <vector>
 

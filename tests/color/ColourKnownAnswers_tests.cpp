@@ -14,24 +14,29 @@
 namespace vora {
 namespace {
 
-struct RgbLab {
+// Per colour: its Lab (L*/100, a*, b*), and its output under a non-symmetric
+// chroma map about means away from zero with a tone curve (i/256)^2 capped at
+// 0.5 (steep, then flat), first with a lightness spread, then with
+// lightnessLow == lightnessHigh (every pixel takes the curve's entry 255).
+struct Answer {
     std::array<int, 3> rgb;
-    std::array<float, 3> lab;  // L*/100, a*, b*
+    std::array<float, 3> lab;
+    std::array<int, 3> spread, noSpread;
 };
-const RgbLab kToLab[] = {
-    {{0, 0, 0}, {-0x1.47ae14p-31f, 0x0.0p+0f, 0x0.0p+0f}},
-    {{255, 255, 255}, {0x1.p+0f, 0x0.0p+0f, 0x0.0p+0f}},
-    {{255, 0, 0}, {0x1.1096e2p-1f, 0x1.407098p+6f, 0x1.0d2936p+6f}},
-    {{0, 255, 0}, {0x1.c12a02p-1f, -0x1.58722ap+6f, 0x1.4cd2cep+6f}},
-    {{0, 0, 255}, {0x1.4b1530p-2f, 0x1.3bca84p+6f, -0x1.af2a5ep+6f}},
-    {{200, 150, 90}, {0x1.527c36p-1f, 0x1.72ea58p+3f, 0x1.3c8666p+5f}},
-    {{17, 94, 201}, {0x1.aae538p-2f, 0x1.41dfe8p+4f, -0x1.f292f6p+5f}},
-    {{250, 20, 180}, {0x1.1effa2p-1f, 0x1.5e5b88p+6f, -0x1.9e6c7cp+4f}},
-    {{1, 2, 3}, {-0x1.47ae14p-31f, 0x0.0p+0f, 0x0.0p+0f}},
-    {{30, 20, 45}, {0x1.bbfcf8p-5f, 0x1.9e45e4p+3f, -0x1.10dedcp+4f}},
-    {{128, 128, 127}, {0x1.144178p-1f, -0x1.392410p-2f, 0x1.1ad960p-1f}},
-    {{64, 200, 30}, {0x1.6e5c88p-1f, -0x1.0584a4p+6f, 0x1.0d7af2p+6f}},
-    {{233, 217, 202}, {0x1.c22712p-1f, 0x1.7a7e88p+1f, 0x1.26e510p+3f}},
+const Answer kAnswers[] = {
+    {{0, 0, 0}, {-0x1.47ae14p-31f, 0x0.0p+0f, 0x0.0p+0f}, {17, 6, 0}, {122, 119, 91}},
+    {{255, 255, 255}, {0x1.p+0f, 0x0.0p+0f, 0x0.0p+0f}, {122, 119, 91}, {122, 119, 91}},
+    {{255, 0, 0}, {0x1.1096e2p-1f, 0x1.407098p+6f, 0x1.0d2936p+6f}, {205, 0, 0}, {255, 0, 41}},
+    {{0, 255, 0}, {0x1.c12a02p-1f, -0x1.58722ap+6f, 0x1.4cd2cep+6f}, {0, 140, 0}, {0, 140, 0}},
+    {{0, 0, 255}, {0x1.4b1530p-2f, 0x1.3bca84p+6f, -0x1.af2a5ep+6f}, {0, 27, 163}, {0, 102, 255}},
+    {{200, 150, 90}, {0x1.527c36p-1f, 0x1.72ea58p+3f, 0x1.3c8666p+5f}, {172, 100, 39}, {172, 100, 39}},
+    {{17, 94, 201}, {0x1.aae538p-2f, 0x1.41dfe8p+4f, -0x1.f292f6p+5f}, {0, 47, 100}, {0, 124, 191}},
+    {{250, 20, 180}, {0x1.1effa2p-1f, 0x1.5e5b88p+6f, -0x1.9e6c7cp+4f}, {174, 0, 124}, {225, 0, 167}},
+    {{1, 2, 3}, {-0x1.47ae14p-31f, 0x0.0p+0f, 0x0.0p+0f}, {17, 6, 0}, {122, 119, 91}},
+    {{30, 20, 45}, {0x1.bbfcf8p-5f, 0x1.9e45e4p+3f, -0x1.10dedcp+4f}, {18, 0, 13}, {124, 115, 121}},
+    {{128, 128, 127}, {0x1.144178p-1f, -0x1.392410p-2f, 0x1.1ad960p-1f}, {76, 73, 49}, {122, 119, 91}},
+    {{64, 200, 30}, {0x1.6e5c88p-1f, -0x1.0584a4p+6f, 0x1.0d7af2p+6f}, {50, 136, 0}, {50, 136, 0}},
+    {{233, 217, 202}, {0x1.c22712p-1f, 0x1.7a7e88p+1f, 0x1.26e510p+3f}, {136, 115, 80}, {136, 115, 80}},
 };
 
 struct LabRgb {
@@ -49,85 +54,38 @@ const LabRgb kToRgb[] = {
     {{0x1.333334p-1f, 0x1.900000p+6f, 0x1.900000p+6f}, {255, 0, 0}},
 };
 
-struct RgbRgb {
-    std::array<int, 3> in;
-    std::array<int, 3> out;
-};
-// A non-symmetric chroma map about means away from zero, and a tone curve
-// (i/256)^2 capped at 0.5: steep, then flat.
-const RgbRgb kSpread[] = {
-    {{0, 0, 0}, {17, 6, 0}},
-    {{255, 255, 255}, {122, 119, 91}},
-    {{255, 0, 0}, {205, 0, 0}},
-    {{0, 255, 0}, {0, 140, 0}},
-    {{0, 0, 255}, {0, 27, 163}},
-    {{200, 150, 90}, {172, 100, 39}},
-    {{17, 94, 201}, {0, 47, 100}},
-    {{250, 20, 180}, {174, 0, 124}},
-    {{1, 2, 3}, {17, 6, 0}},
-    {{30, 20, 45}, {18, 0, 13}},
-    {{128, 128, 127}, {76, 73, 49}},
-    {{64, 200, 30}, {50, 136, 0}},
-    {{233, 217, 202}, {136, 115, 80}},
-};
-// lightnessLow == lightnessHigh: every pixel takes the curve's entry 255.
-const RgbRgb kNoSpread[] = {
-    {{0, 0, 0}, {122, 119, 91}},
-    {{255, 255, 255}, {122, 119, 91}},
-    {{255, 0, 0}, {255, 0, 41}},
-    {{0, 255, 0}, {0, 140, 0}},
-    {{0, 0, 255}, {0, 102, 255}},
-    {{200, 150, 90}, {172, 100, 39}},
-    {{17, 94, 201}, {0, 124, 191}},
-    {{250, 20, 180}, {225, 0, 167}},
-    {{1, 2, 3}, {122, 119, 91}},
-    {{30, 20, 45}, {124, 115, 121}},
-    {{128, 128, 127}, {122, 119, 91}},
-    {{64, 200, 30}, {50, 136, 0}},
-    {{233, 217, 202}, {136, 115, 80}},
-};
-
 TRANSFER TestTransfer(float low, float high) {
-    TRANSFER t{};
-    t.contentMean[0] = 3.5f;
-    t.contentMean[1] = -6.25f;
-    t.styleMean[0] = -2.0f;
-    t.styleMean[1] = 9.75f;
-    const float map[4] = {1.125f, 0.375f, -0.25f, 0.875f};
-    std::copy(map, map + 4, t.chromaMatrix);
+    TRANSFER t{0, 0, {3.5f, -6.25f}, {-2.0f, 9.75f}, {1.125f, 0.375f, -0.25f, 0.875f}, {}, low, high, {}};
     for (int i = 0; i < 257; ++i) t.toneCurve[i] = std::min((i / 256.0f) * (i / 256.0f), 0.5f);
-    t.lightnessLow = low;
-    t.lightnessHigh = high;
     return t;
 }
 
 TEST(ColourKnownAnswers, RgbToLabAndBack) {
-    for (const RgbLab& k : kToLab) {
+    for (const Answer& k : kAnswers) {
         const LabPixel lab = RgbToLab(k.rgb[0], k.rgb[1], k.rgb[2]);
         EXPECT_EQ((std::array<float, 3>{lab.lightness01, lab.a, lab.b}), k.lab)
             << k.rgb[0] << "," << k.rgb[1] << "," << k.rgb[2];
     }
     for (const LabRgb& k : kToRgb) {
         const Rgb8 rgb = LabToRgb(k.lab[0], k.lab[1], k.lab[2]);
-        EXPECT_EQ((std::array<int, 3>{rgb.red, rgb.green, rgb.blue}), k.rgb) << k.lab[0] << "," << k.lab[1] << "," << k.lab[2];
+        EXPECT_EQ((std::array<int, 3>{rgb.red, rgb.green, rgb.blue}), k.rgb)
+            << k.lab[0] << "," << k.lab[1] << "," << k.lab[2];
     }
 }
 
 // Through the library's apply, one pixel per answer.
 TEST(ColourKnownAnswers, TransferOfOnePixel) {
-    const std::pair<const RgbRgb*, TRANSFER> cases[] = {{kSpread, TestTransfer(0.125f, 0.875f)},
-                                                       {kNoSpread, TestTransfer(0.4f, 0.4f)}};
-    constexpr size_t kCount = std::size(kSpread);
-    static_assert(std::size(kNoSpread) == kCount, "one answer per colour");
-    for (const auto& [answers, transfer] : cases) {
+    constexpr size_t kCount = std::size(kAnswers);
+    for (const bool spread : {true, false}) {
+        const TRANSFER transfer = spread ? TestTransfer(0.125f, 0.875f) : TestTransfer(0.4f, 0.4f);
         cv::Mat in(1, kCount, CV_8UC3), out(1, kCount, CV_8UC3, cv::Scalar::all(7));
         for (size_t i = 0; i < kCount; ++i)
-            in.at<cv::Vec3b>(0, i) = cv::Vec3b(answers[i].in[0], answers[i].in[1], answers[i].in[2]);
+            in.at<cv::Vec3b>(0, i) = cv::Vec3b(kAnswers[i].rgb[0], kAnswers[i].rgb[1], kAnswers[i].rgb[2]);
         ApplyTransfer(testimages::ImageHandle(in).get(), transfer, testimages::ImageHandle(out).get());
         for (size_t i = 0; i < kCount; ++i) {
             const cv::Vec3b got = out.at<cv::Vec3b>(0, i);
-            EXPECT_EQ((std::array<int, 3>{got[0], got[1], got[2]}), answers[i].out)
-                << answers[i].in[0] << "," << answers[i].in[1] << "," << answers[i].in[2];
+            EXPECT_EQ((std::array<int, 3>{got[0], got[1], got[2]}), spread ? kAnswers[i].spread : kAnswers[i].noSpread)
+                << kAnswers[i].rgb[0] << "," << kAnswers[i].rgb[1] << "," << kAnswers[i].rgb[2];
         }
     }
 }

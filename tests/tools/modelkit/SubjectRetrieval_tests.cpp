@@ -40,17 +40,6 @@ TEST(SubjectRetrieval, NeighboursAndPrecisionOnAHandWorkedSet) {
     EXPECT_THROW(MeasureSubjectPrecision(kLine, {"a"}), std::invalid_argument);
 }
 
-TEST(SubjectRetrieval, LabHistogramBinsByEightBitLab) {
-    // Black is L 0, a 128, b 128: bin (0, 4, 4); white has L 255: bin (7, 4, 4).
-    cv::Mat photo(4, 6, CV_8UC3, cv::Scalar::all(0));
-    photo(cv::Rect(0, 0, 6, 1)).setTo(cv::Scalar::all(255));
-    const std::vector<float> histogram = LabHistogram(photo);
-    ASSERT_EQ(histogram.size(), 512u);
-    EXPECT_FLOAT_EQ(histogram[0 * 64 + 4 * 8 + 4], 0.75f);
-    EXPECT_FLOAT_EQ(histogram[7 * 64 + 4 * 8 + 4], 0.25f);
-    EXPECT_EQ(cv::countNonZero(cv::Mat(histogram)), 2);
-}
-
 TEST(SubjectRetrieval, SubFoldersNameTheSubjects) {
     kit_testing::TempDir dir;
     const cv::Mat pixel(2, 2, CV_8UC3, cv::Scalar::all(7));

@@ -14,9 +14,7 @@ namespace {
 using namespace vora::clitest;
 
 TEST_F(CliTest, BatchRendersAsApplyDoesSkipsWhatExistsAndReportsFailures) {
-    ASSERT_EQ(Run({"match", "photo.png", "--style-index", "3", "m.png", "--model", m_modelDir, "--json", "t.json"})
-                  .status,
-              0);
+    ASSERT_TRUE(WriteTransfers());
     WriteRgb(m_work + "/b.jpg", m_photo);
     std::ofstream(m_work + "/broken.jpg") << "not an image";
     ASSERT_EQ(Run({"apply", "photo.png", "t.json", "one.png"}).status, 0);

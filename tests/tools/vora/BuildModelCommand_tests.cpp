@@ -1,7 +1,6 @@
 // build-model: reproducible models that serve, and the choice of network.
 
 #include <filesystem>
-#include <set>
 #include <string>
 
 #include <gtest/gtest.h>

@@ -55,6 +55,11 @@ class CliTest : public ::testing::Test {
 protected:
     void SetUp() override { WriteRgb(m_work + "/photo.png", m_photo); }
     RunResult Run(const std::vector<std::string>& args) { return RunVora(m_work, args); }
+    // Writes t.json, the transfer of `photo` toward style 3, and first.png, its rendering.
+    bool WriteTransfers(const std::string& photo = "photo.png") {
+        return Run({"match", photo, "--style-index", "3", "first.png", "--model", m_modelDir, "--json", "t.json"})
+                   .status == 0;
+    }
 
     // Runs a command that must be refused: its status, a single line on
     // standard error that starts with "vora: " and contains `mentions`, and

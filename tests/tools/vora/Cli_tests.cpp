@@ -17,9 +17,8 @@ using namespace vora::clitest;
 
 TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
     const std::string& m = m_modelDir;
-    ASSERT_EQ(Run({"match", "photo.png", "photo.png", "first.png", "--model", m, "--json", "t.json"}).status, 0);
+    ASSERT_TRUE(WriteTransfers());
     vora::fixtures::WriteBytes(m_work + "/garbage.jpg", "this is not a picture");
-    vora::fixtures::WriteBytes(m_work + "/empty.png", "");
     vora::fixtures::WriteBytes(m_work + "/broken.json", "{\"format\": \"vora-transfers\", ");
     vora::fixtures::WriteBytes(m_work + "/future.json", "{\"format\": \"vora-transfers\", \"version\": 9}");
     // A 16384 x 16384 PNG of a few hundred kilobytes (decoding it took 7 GB),
@@ -38,19 +37,16 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
         {{"resize"}, 2, "unknown command 'resize'"},
         {{"suggest", "photo.png", "--model", m, "--colour", "red"}, 2, "unknown option --colour"},
         {{"suggest", "photo.png", "--model", m, "-n", "0"}, 2, "-n"},
-        {{"suggest", "photo.png", "--model", m, "-n", "five"}, 2, "-n"},
         // 12 styles: the library keeps the better 6 per cluster.
         {{"suggest", "photo.png", "--model", m, "-n", "7"}, 2, "6 styles"},
         {{"suggest", "photo.png", "--model", m, "--ranking", "nan"}, 2, "--ranking"},
         {{"suggest", "photo.png", "--model", m, "--preview", "8"}, 2, "--preview"},
         {{"suggest", "photo.png", "--model", m, "--full", "--preview", "100"}, 2, "choose one"},
-        {{"suggest", "photo.png", "--model", m, "--solve", "0"}, 2, "--solve"},
-        {{"suggest", "photo.png", "--model", m, "--limit", "inf"}, 2, "--limit"},
+        {{"suggest", "photo.png", "--model", m, "--solve", "0"}, 2, "--solve"},  // its bound is exclusive
         {{"suggest", "photo.png", "--model", m, "--finish", "3"}, 2, "--finish"},
         {{"suggest", "photo.png", "--model", m, "-n", "2", "--out", "old"}, 2, "old/photo-4.jpg: a proposal of an earlier run"},
         {{"suggest", "photo.png", "--model", m, "--faces", "0.6,0.4,0.1,0.5"}, 2, "0.6,0.4,0.1,0.5"},
         {{"suggest", "photo.png", "--model", m, "--faces", "0.1,0.4,0.5,1.5"}, 2, "--faces"},
-        {{"suggest", "photo.png", "--model", m, "--faces", "0.1,0.4"}, 2, "--faces"},
         {{"suggest", "photo.png", "--model", m, "--faces", "auto", "--faces", "0.1,0.4,0.1,0.4"}, 2, "auto"},
         {{"match", "photo.png", "--style-index", "12", "out.png", "--model", m}, 2, "--style-index"},
         {{"match", "photo.png", "photo.png", "out.bmp", "--model", m}, 2, "out.bmp"},
@@ -65,7 +61,6 @@ TEST_F(CliTest, BadInputGetsItsMessageAndStatusAndWritesNothing) {
         {{"match", "photo.png", "photo.png", "o.png", "--model", m, "--json", "t.json"}, 2, "t.json: already exists"},
         // Failures exit 1, naming the file.
         {{"suggest", "garbage.jpg", "--model", m, "--faces", "none"}, 1, "garbage.jpg: cannot read image"},
-        {{"suggest", "empty.png", "--model", m}, 1, "empty.png: cannot read image"},
         {{"suggest", "absent.png", "--model", m}, 1, "absent.png: no such file"},
         {{"apply", "photo.png", "broken.json", "out.png", "--model", m}, 1, "broken.json: not a valid JSON"},
         {{"apply", "photo.png", "future.json", "out.png", "--model", m}, 1, "format version 9"},

@@ -64,9 +64,7 @@ class ColourAndMetadata : public CliTest {
 protected:
     void SetUp() override {
         CliTest::SetUp();
-        ASSERT_EQ(Run({"match", "photo.png", "--style-index", "3", "m.png", "--model", m_modelDir, "--json", "t.json"})
-                      .status,
-                  0);
+        ASSERT_TRUE(WriteTransfers());
     }
     // Runs a shell command in the work folder.
     int Shell(const std::string& command) { return std::system(("cd '" + m_work + "' && " + command).c_str()); }
