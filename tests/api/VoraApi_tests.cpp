@@ -12,7 +12,6 @@
 #include <opencv2/imgproc.hpp>
 
 #include "api/ApiFixture.h"
-#include "color/WorkingOrder.h"
 #include "model/ModelFileNames.h"
 #include "transfer/ColourStatistics.h"
 
@@ -31,11 +30,8 @@ class VoraApi : public ApiTest {};
 TEST_F(VoraApi, AllFormsAgree) {
     cv::Mat styleImage = testimages::SyntheticPhotoRgb(90, 70, 99);  // not the content's size
     const ImageHandle style(styleImage);
-    cv::Mat lab(styleImage.size(), CV_32FC3);
-    ConvertToLab(ToWorkingOrder(style.get()), lab);
     ColourStats& record = options.styles[12] = ColourStats{};
-    ComputeChromaStats(lab, record);
-    ComputeLightnessStats(lab, record);
+    SummariseColours(styleImage, ChannelOrder::Rgb, record);
     record.lightnessLow = record.lightnessHigh = 0.0f;  // not stored in the database
     vora_api api = Api(options);
     const CFaceRect faces[] = {CFaceRect(0.3, 0.5, 0.25, 0.55)};

@@ -163,45 +163,35 @@ FixtureOptions RandomDatabase(int clusters, int styles, uint32_t seed) {
     return options;
 }
 
-std::string MakeTempFolder() {
-    std::string pattern = (std::filesystem::temp_directory_path() / "vora-fixture-XXXXXX").string();
-    if (mkdtemp(&pattern[0]) == nullptr) throw std::runtime_error("cannot make a temporary folder");
-    return pattern;
+TempFolder::TempFolder() : m_path((std::filesystem::temp_directory_path() / "vora-fixture-XXXXXX").string()) {
+    if (mkdtemp(&m_path[0]) == nullptr) throw std::runtime_error("cannot make a temporary folder");
 }
 
-void RemoveTree(const std::string& path) {
+TempFolder::~TempFolder() {
     std::error_code ignored;
-    std::filesystem::remove_all(path, ignored);
+    std::filesystem::remove_all(m_path, ignored);
 }
 
-ModelFixture::ModelFixture(const FixtureOptions& o) : m_root(MakeTempFolder()), m_modelDir(m_root + "/model/") {
-    try {
-        std::filesystem::create_directories(m_modelDir);
-        const auto count = [](std::optional<int32_t> c, size_t n) { return c.value_or(static_cast<int32_t>(n)); };
-        std::vector<float> centres, styles, scores, distances;
-        for (const ClusterCentre& centre : o.centres) centres.insert(centres.end(), centre.begin(), centre.end());
-        for (const ColourStats& style : o.styles) styles.insert(styles.end(), style.data(), style.data() + 38);
-        const size_t rows = o.scores.size(), columns = rows ? o.scores[0].size() : o.styles.size();
-        for (size_t i = 0; i < rows * columns; ++i)
-            scores.push_back(o.transposeScores ? o.scores[i % rows][i / rows] : o.scores[i / columns][i % columns]);
-        for (size_t i = 0; i < o.distances.size(); ++i)
-            distances.insert(distances.end(), o.distances[i].begin() + static_cast<long>(i), o.distances[i].end());
-        std::vector<int32_t> shape = {count(o.scoreRows, rows), count(o.scoreColumns, columns)};
-        if (o.transposeScores) std::swap(shape[0], shape[1]);
-        if (o.writeClusters)
-            WriteDataFile(DataFile(kClusterFileName), {count(o.clusterCount, o.centres.size())}, centres);
-        if (o.writeStyles) WriteDataFile(DataFile(kStyleFileName), {count(o.styleCount, o.styles.size())}, styles);
-        if (o.writeScores) WriteDataFile(DataFile(kScoresFileName), shape, scores);
-        if (o.writeDistances)
-            WriteDataFile(DataFile(kDistanceFileName), {count(o.distanceCount, o.distances.size())}, distances);
-        WriteFixtureNetwork(m_modelDir + kNetworkFolder, o.network);
-    } catch (...) {
-        RemoveTree(m_root);
-        throw;
-    }
+ModelFixture::ModelFixture(const FixtureOptions& o) {
+    std::filesystem::create_directories(m_modelDir);
+    const auto count = [](std::optional<int32_t> c, size_t n) { return c.value_or(static_cast<int32_t>(n)); };
+    std::vector<float> centres, styles, scores, distances;
+    for (const ClusterCentre& centre : o.centres) centres.insert(centres.end(), centre.begin(), centre.end());
+    for (const ColourStats& style : o.styles) styles.insert(styles.end(), style.data(), style.data() + 38);
+    const size_t rows = o.scores.size(), columns = rows ? o.scores[0].size() : o.styles.size();
+    for (size_t i = 0; i < rows * columns; ++i)
+        scores.push_back(o.transposeScores ? o.scores[i % rows][i / rows] : o.scores[i / columns][i % columns]);
+    for (size_t i = 0; i < o.distances.size(); ++i)
+        distances.insert(distances.end(), o.distances[i].begin() + static_cast<long>(i), o.distances[i].end());
+    std::vector<int32_t> shape = {count(o.scoreRows, rows), count(o.scoreColumns, columns)};
+    if (o.transposeScores) std::swap(shape[0], shape[1]);
+    if (o.writeClusters) WriteDataFile(DataFile(kClusterFileName), {count(o.clusterCount, o.centres.size())}, centres);
+    if (o.writeStyles) WriteDataFile(DataFile(kStyleFileName), {count(o.styleCount, o.styles.size())}, styles);
+    if (o.writeScores) WriteDataFile(DataFile(kScoresFileName), shape, scores);
+    if (o.writeDistances)
+        WriteDataFile(DataFile(kDistanceFileName), {count(o.distanceCount, o.distances.size())}, distances);
+    WriteFixtureNetwork(m_modelDir + kNetworkFolder, o.network);
 }
-
-ModelFixture::~ModelFixture() { RemoveTree(m_root); }
 
 std::string ModelFixture::DataFile(const char* name) const { return DataFilePath(m_modelDir, name); }
 

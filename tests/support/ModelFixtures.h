@@ -79,13 +79,24 @@ struct FixtureOptions {
 // a zero diagonal). The same seed gives the same tables.
 FixtureOptions RandomDatabase(int clusters, int styles, uint32_t seed = 1);
 
+// A fresh temporary folder (its path has no trailing separator), removed
+// with everything in it when the object goes, however the test ends.
+class TempFolder {
+public:
+    TempFolder();
+    ~TempFolder();
+    TempFolder(const TempFolder&) = delete;
+    TempFolder& operator=(const TempFolder&) = delete;
+    const std::string& path() const { return m_path; }
+
+private:
+    std::string m_path;
+};
+
 // A model directory in a fresh temporary folder, removed on destruction.
 class ModelFixture {
 public:
     explicit ModelFixture(const FixtureOptions& options = FixtureOptions());
-    ~ModelFixture();
-    ModelFixture(const ModelFixture&) = delete;
-    ModelFixture& operator=(const ModelFixture&) = delete;
 
     // "<root>/model/"
     const std::string& modelDir() const { return m_modelDir; }
@@ -93,25 +104,8 @@ public:
     std::string DataFile(const char* name) const;  // where the loader reads it
 
 private:
-    std::string m_root, m_modelDir;
-};
-
-// A fresh empty temporary folder (no trailing separator); the caller removes it.
-std::string MakeTempFolder();
-void RemoveTree(const std::string& path);
-
-// A fresh temporary folder, removed with everything in it when the object
-// goes, however the test ends.
-class TempFolder {
-public:
-    TempFolder() : m_path(MakeTempFolder()) {}
-    ~TempFolder() { RemoveTree(m_path); }
-    TempFolder(const TempFolder&) = delete;
-    TempFolder& operator=(const TempFolder&) = delete;
-    const std::string& path() const { return m_path; }
-
-private:
-    std::string m_path;
+    TempFolder m_folder;  // first: a constructor that throws still removes it
+    std::string m_root = m_folder.path(), m_modelDir = m_root + "/model/";
 };
 
 }  // namespace fixtures

@@ -41,12 +41,6 @@ public:
         const std::string bytes(reinterpret_cast<const char*>(values.data()), values.size() * 4);
         return Stored(name, shape, std::is_same_v<T, float> ? "float32" : "int32", bytes, json());
     }
-    Graph& Floats(const std::string& name, std::vector<int> shape, const std::vector<float>& values) {
-        return Values(name, shape, values);
-    }
-    Graph& Ints(const std::string& name, std::vector<int> shape, const std::vector<int32_t>& values) {
-        return Values(name, shape, values);
-    }
     Graph& Stored(const std::string& name, std::vector<int> shape, const std::string& dtype, const std::string& bytes,
                   const json& quantization) {
         m_nodes.push_back({{"name", name}, {"op", "Const"}});
@@ -63,14 +57,14 @@ public:
     // A 4-D convolution filter H, W, in, out, channels last.
     Graph& Conv(const std::string& name, const std::string& input, std::vector<int> hwio, const std::vector<float>& filter,
                 const std::string& padding = "VALID", int stride = 1) {
-        Floats(name + "/filter", hwio, filter);
+        Values<float>(name + "/filter", hwio, filter);
         const json strides = json::array({"1", std::to_string(stride), std::to_string(stride), "1"});
         return Op(name, "Conv2D", {input, name + "/filter"},
                   {{"padding", {{"s", Base64(padding)}}}, {"data_format", {{"s", Base64("NHWC")}}},
                    {"strides", {{"list", {{"i", strides}}}}}});
     }
     Graph& Transpose(const std::string& name, const std::string& input, std::vector<int32_t> perm) {
-        Ints(name + "/perm", {4}, perm);
+        Values<int32_t>(name + "/perm", {4}, perm);
         return Op(name, "Transpose", {input, name + "/perm"});
     }
 
@@ -131,13 +125,13 @@ TEST(TfjsConverter, RemapsAxesAndFoldsNormalisationIntoTheFirstConvolution) {
         .Transpose("to_last", "image", {0, 2, 3, 1})
         // out0 = R', out1 = B' (normalised), so the swap shows.
         .Conv("conv", "to_last", {1, 1, 3, 2}, {1, 0, 0, 0, 0, 1})
-        .Floats("bias", {2}, {100, 200})
+        .Values<float>("bias", {2}, {100, 200})
         .Op("biased", "BiasAdd", {"conv", "bias"})
         .Transpose("to_first", "biased", {0, 3, 1, 2})
         .Transpose("again_last", "to_first", {0, 2, 3, 1})
-        .Ints("axis", {}, {-1})
+        .Values<int32_t>("axis", {}, {-1})
         .Op("joined", "ConcatV2", {"again_last", "biased", "axis"})
-        .Ints("hw", {2}, {1, 2})
+        .Values<int32_t>("hw", {2}, {1, 2})
         .Op("mean", "Mean", {"joined", "hw"}, {{"keep_dims", {{"b", true}}}});
     TfjsConversion options = Options(g.Write(dir.path), "mean:0", 4);
     options.mean = {{1, 2, 4}};
@@ -172,11 +166,11 @@ TEST(TfjsConverter, DecodesHalfAndAffineWeightsExactly) {
         .Op("conv", "Conv2D", {"image", "w"})
         .Stored("b", {2}, "float32", half, json{{"dtype", "float16"}})
         .Op("c1", "BiasAdd", {"conv", "b"})
-        .Floats("w2", {1, 1, 2, 3}, {1, 0, 0, 0, 1, 0})
+        .Values<float>("w2", {1, 1, 2, 3}, {1, 0, 0, 0, 1, 0})
         .Op("conv2", "Conv2D", {"c1", "w2"})
         .Stored("b2", {3}, "float32", bytes, json{{"dtype", "uint8"}, {"scale", 0.1}, {"min", -1.0}})
         .Op("c2", "Add", {"conv2", "b2"})
-        .Floats("w3", {1, 1, 3, 2}, {1, 0, 0, 1, 0, 0})
+        .Values<float>("w3", {1, 1, 3, 2}, {1, 0, 0, 1, 0, 0})
         .Op("conv3", "Conv2D", {"c2", "w3"})
         .Stored("b3", {2}, "float32", words, json{{"dtype", "uint16"}, {"scale", 0.25}, {"min", 0.5}})
         .Op("c3", "AddV2", {"b3", "conv3"});
