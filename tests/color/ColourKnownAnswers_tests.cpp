@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <array>
+#include <cmath>
 #include <cstdint>
 
 #include "color/ApplyTransfer.h"
@@ -52,6 +53,10 @@ const LabRgb kToRgb[] = {
     {{0x1.p+0f, 0x0.0p+0f, 0x0.0p+0f}, {255, 255, 255}},
     {{0x0.0p+0f, 0x0.0p+0f, 0x0.0p+0f}, {0, 0, 0}},
     {{0x1.333334p-1f, 0x1.900000p+6f, 0x1.900000p+6f}, {255, 0, 0}},
+    {{-0x1.47ae14p-31f, 0x0.0p+0f, 0x0.0p+0f}, {0, 0, 0}},  // black's own Lab
+    {{0x1.p+1f, 0x0.0p+0f, 0x0.0p+0f}, {255, 255, 255}},  // beyond the gamut: clamped, never read past a table
+    {{0x1.p-1f, 0x1.2cp+8f, 0x0.0p+0f}, {255, 0, 137}},
+    {{NAN, NAN, NAN}, {0, 0, 0}},  // NaN encodes as 0
 };
 
 TRANSFER TestTransfer(float low, float high) {

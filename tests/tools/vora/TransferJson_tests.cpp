@@ -81,10 +81,10 @@ TEST(TransferJson, MalformedRecordsAreNamed) {
               "transfers[0].clusterIndex: number out of the 32-bit range"},
              // 20,000 corrections made apply on 512 x 512 take a minute.
              {[](json& j) {
-                  json face = {{"centreX", 0.5}, {"centreY", 0.5}, {"halfSizeX", 0.1}, {"halfSizeY", 0.1},
-                               {"measuredL", 0.2}, {"measuredA", 1}, {"measuredB", 2}, {"exponent", 0.6}};
-                  j["transfers"][0]["faceCorrections"] = json::array();
-                  for (int i = 0; i < 257; ++i) j["transfers"][0]["faceCorrections"].push_back(face);
+                  vora::cli::TransferDocument crowded;
+                  crowded.transfers.resize(1);
+                  crowded.transfers[0].faceCorrections.resize(257);
+                  j = json::parse(vora::cli::SerializeTransfers(crowded));
               },
               "transfers[0].faceCorrections: holds 257 face corrections; at most 256 are accepted"}}) {
         json text = json::parse(good);
