@@ -3,12 +3,8 @@
 #include <sstream>
 
 #include <gtest/gtest.h>
-#include <opencv2/imgcodecs.hpp>
-
-#include "KitTesting.h"
 
 using namespace vora::modelkit;
-namespace fs = std::filesystem;
 
 namespace {
 
@@ -38,20 +34,4 @@ TEST(SubjectRetrieval, NeighboursAndPrecisionOnAHandWorkedSet) {
         rows << row.subject << " " << row.photos << " " << row.atOne * 21 << " " << row.atFive * 35 << "; ";
     EXPECT_EQ(rows.str(), "a 3 21 14; b 3 14 14; c 1 0 0; all 7 15 12; ");  // scaled to whole numbers
     EXPECT_THROW(MeasureSubjectPrecision(kLine, {"a"}), std::invalid_argument);
-}
-
-TEST(SubjectRetrieval, SubFoldersNameTheSubjects) {
-    kit_testing::TempDir dir;
-    const cv::Mat pixel(2, 2, CV_8UC3, cv::Scalar::all(7));
-    EXPECT_THROW(ListLabelledPhotos(dir.path.string()), std::runtime_error);
-    for (const char* folder : {"water", "people", "empty"}) fs::create_directories(dir.path / folder);
-    for (const char* file : {"water/b.png", "water/a.jpg", "people/z.png", "stray.png"})
-        cv::imwrite((dir.path / file).string(), pixel);
-
-    const std::vector<LabelledPhoto> photos = ListLabelledPhotos(dir.path.string());
-    ASSERT_EQ(photos.size(), 3u);
-    std::string listed;
-    for (const LabelledPhoto& photo : photos)
-        listed += photo.subject + "/" + fs::path(photo.path).filename().string() + " ";
-    EXPECT_EQ(listed, "people/z.png water/a.jpg water/b.png ");
 }
