@@ -125,7 +125,7 @@ void BM_SummariseColours(benchmark::State& state) {
 // megapixels, with each colour kernel this machine can run (argument: 0
 // scalar, 1 AVX2), so the vector kernel's gain shows against the scalar one.
 void BM_ChromaKernel(benchmark::State& state) {
-    const auto kernel = static_cast<vora::ChromaKernel>(state.range(0));
+    const auto kernel = static_cast<vora::VectorKernel>(state.range(0));
     const cv::Mat& photo = vora::bench::Photo24();
     if (photo.empty() || !vora::LabByTables::Available(kernel)) {
         state.SkipWithError(photo.empty() ? "sample photos not fetched" : "kernel not available here");

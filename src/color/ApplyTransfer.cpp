@@ -2,7 +2,8 @@
 // prepared once, then a kernel runs over bands of whole rows. Two kernels give
 // the same bytes: the plain per-pixel chain, and one that evaluates the chain
 // once per distinct colour (outside face boxes a pixel's output depends on its
-// colour alone) through a small per-thread cache.
+// colour alone) through a small per-thread cache, computing missed colours
+// in batches.
 #include "color/ApplyTransfer.h"
 
 #include <algorithm>
@@ -19,6 +20,11 @@
 #include "color/ColorConversion.h"
 #include "color/LabByTables.h"
 #include "color/PixelTransfer.h"
+#include "color/TransferColours.h"
+
+#ifdef VORA_AVX2_KERNEL
+#include <immintrin.h>
+#endif
 
 namespace vora {
 namespace {
@@ -91,18 +97,11 @@ void RunBand(const ApplyTransferWorker& worker, size_t rowBegin, size_t rowEnd, 
     }
 }
 
-// The output of a pixel outside every face box, packed as R << 16 | G << 8 | B:
-// the plain kernel's chain without the face step. The conversion by tables
-// has RgbToLab's bits for every colour and costs less on each cache miss.
-inline uint32_t TransferColour(const LabByTables& toLab, const TRANSFER& transfer, uint8_t red, uint8_t green,
-                               uint8_t blue) {
-    std::size_t lightnessEntry;
-    const LabPixel lab = toLab(red, green, blue, lightnessEntry);
-    const float lightness = ToneCurveLookup(
-        transfer.toneCurve, NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
-    const ChromaPixel chroma = MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
-    const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
-    return static_cast<uint32_t>(rgb.red) << 16 | static_cast<uint32_t>(rgb.green) << 8 | rgb.blue;
+// Writes a packed R << 16 | G << 8 | B output into a pixel's first three bytes.
+inline void WritePacked(uint8_t* pixel, uint32_t rgb) {
+    pixel[0] = static_cast<uint8_t>(rgb >> 16);
+    pixel[1] = static_cast<uint8_t>(rgb >> 8);
+    pixel[2] = static_cast<uint8_t>(rgb);
 }
 
 }  // namespace
@@ -119,16 +118,118 @@ unsigned ColourCacheBits(size_t pixels) {
 
 namespace {
 
-// The cached kernel. Rows that meet no face box take every pixel from the
-// cache; in rows that do, pixels inside a box take the plain chain with the
-// faces whose boxes meet the row, in record order (the others cannot contain
-// the pixel, so the maximum over faces is unchanged).
+// Pixels per batch of the cached kernel's rows without faces.
+constexpr size_t kBatch = 512;
+
+// The first pass of RunBatch over pixels [first, end): each colour into
+// colours[i], what its entry holds into the pixel, and the index of each
+// miss into `missed`; returns the number of misses.
+size_t LookUp(ColourCache& cache, const uint8_t* source, uint8_t* destination, size_t first, size_t end,
+              size_t pixelStride, uint32_t* colours, uint32_t* missed) {
+    uint64_t entries[kBatch];
+    // Loads only, so that many lookups are in flight at once.
+    for (size_t i = first; i < end; ++i) {
+        const uint8_t* pixel = source + i * pixelStride;
+        colours[i] = PackRgb(pixel[0], pixel[1], pixel[2]);
+        entries[i] = cache.Slot(colours[i]);
+    }
+    // Every colour was read before any pixel is written: in place is safe.
+    size_t misses = 0;
+    for (size_t i = first; i < end; ++i) {
+        missed[misses] = static_cast<uint32_t>(i);
+        misses += ColourCache::Holds(entries[i], colours[i]) ? 0 : 1;
+        WritePacked(destination + i * pixelStride, ColourCache::Output(entries[i]));
+    }
+    return misses;
+}
+
+#ifdef VORA_AVX2_KERNEL
+// LookUp over `count` (a multiple of 8) pixels of three bytes, eight at a
+// time: the colours by a byte shuffle, the entries by two gathers. Each group
+// of 24 bytes is read whole before it is written, so in place is safe.
+__attribute__((target("avx2"))) size_t LookUpAvx2(const ColourCache& cache, const uint8_t* source,
+                                                  uint8_t* destination, size_t count, uint32_t* colours,
+                                                  uint32_t* missed) {
+    // Pixels 0-3 from bytes 0-11 of the low half, 4-7 from bytes 4-15 of the
+    // high half (loaded from byte 8), each as 0, R, G, B.
+    const __m256i toColours = _mm256_setr_epi8(2, 1, 0, -128, 5, 4, 3, -128, 8, 7, 6, -128, 11, 10, 9, -128,  //
+                                               6, 5, 4, -128, 9, 8, 7, -128, 12, 11, 10, -128, 15, 14, 13, -128);
+    // Back to R, G, B bytes: twelve per half, then the halves joined.
+    const __m256i toBytes = _mm256_setr_epi8(2, 1, 0, 6, 5, 4, 10, 9, 8, 14, 13, 12, -128, -128, -128, -128,  //
+                                             2, 1, 0, 6, 5, 4, 10, 9, 8, 14, 13, 12, -128, -128, -128, -128);
+    const __m256i joinBytes = _mm256_setr_epi32(0, 1, 2, 4, 5, 6, 3, 7);
+    const __m256i lowsThenHighs = _mm256_setr_epi32(0, 2, 4, 6, 1, 3, 5, 7);
+    const __m256i multiplier = _mm256_set1_epi32(static_cast<int>(ColourCache::kMultiplier));
+    const __m256i tagBit = _mm256_set1_epi32(static_cast<int>(ColourCache::kTagBit));
+    const __m128i shift = _mm_cvtsi32_si128(static_cast<int>(cache.Shift()));
+    const long long* entries = reinterpret_cast<const long long*>(cache.Entries());
+
+    size_t misses = 0;
+    for (size_t i = 0; i < count; i += 8) {
+        const uint8_t* pixels = source + 3 * i;
+        const __m256i bytes = _mm256_set_m128i(_mm_loadu_si128(reinterpret_cast<const __m128i*>(pixels + 8)),
+                                               _mm_loadu_si128(reinterpret_cast<const __m128i*>(pixels)));
+        const __m256i colour = _mm256_shuffle_epi8(bytes, toColours);
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(colours + i), colour);
+        const __m256i slots = _mm256_srl_epi32(_mm256_mullo_epi32(colour, multiplier), shift);
+        const __m256i low = _mm256_permutevar8x32_epi32(
+            _mm256_i32gather_epi64(entries, _mm256_castsi256_si128(slots), 8), lowsThenHighs);
+        const __m256i high = _mm256_permutevar8x32_epi32(
+            _mm256_i32gather_epi64(entries, _mm256_extracti128_si256(slots, 1), 8), lowsThenHighs);
+        const __m256i outputs = _mm256_permute2x128_si256(low, high, 0x20);
+        const __m256i tags = _mm256_permute2x128_si256(low, high, 0x31);
+        const __m256i hits = _mm256_cmpeq_epi32(tags, _mm256_or_si256(colour, tagBit));
+        for (unsigned miss = ~static_cast<unsigned>(_mm256_movemask_ps(_mm256_castsi256_ps(hits))) & 0xFFu; miss != 0;
+             miss &= miss - 1)
+            missed[misses++] = static_cast<uint32_t>(i + static_cast<unsigned>(__builtin_ctz(miss)));
+        const __m256i packed = _mm256_permutevar8x32_epi32(_mm256_shuffle_epi8(outputs, toBytes), joinBytes);
+        uint8_t* written = destination + 3 * i;
+        _mm_storeu_si128(reinterpret_cast<__m128i*>(written), _mm256_castsi256_si128(packed));
+        _mm_storel_epi64(reinterpret_cast<__m128i*>(written + 16), _mm256_extracti128_si256(packed, 1));
+    }
+    return misses;
+}
+#else
+size_t LookUpAvx2(const ColourCache&, const uint8_t*, uint8_t*, size_t, uint32_t*, uint32_t*) { return 0; }
+#endif
+
+
+// A run of pixels of one row outside every face box, in three passes. The
+// first looks every colour up and writes what its entry holds, noting the
+// misses without a branch; the second computes the missed colours together
+// (TransferColours); the third stores them and rewrites those pixels. A colour
+// missed twice in a batch is computed twice, to the same bytes.
+void RunBatch(ColourCache& cache, VectorKernel kernel, const TRANSFER& transfer, const uint8_t* in, uint8_t* out,
+              size_t count, size_t pixelStride) {
+    uint32_t colours[kBatch], missed[kBatch], missColours[kBatch], missOutputs[kBatch];
+    const bool vector = kernel == VectorKernel::Avx2 && pixelStride == 3;
+    for (size_t done = 0; done < count; done += kBatch) {
+        const size_t n = std::min(kBatch, count - done);
+        const uint8_t* source = in + done * pixelStride;
+        uint8_t* destination = out + done * pixelStride;
+        const size_t looked = vector ? n & ~size_t{7} : 0;
+        size_t misses = looked > 0 ? LookUpAvx2(cache, source, destination, looked, colours, missed) : 0;
+        misses += LookUp(cache, source, destination, looked, n, pixelStride, colours, missed + misses);
+        for (size_t j = 0; j < misses; ++j) missColours[j] = colours[missed[j]];
+        TransferColours(kernel, transfer, missColours, misses, missOutputs);
+        for (size_t j = 0; j < misses; ++j) {
+            cache.Slot(missColours[j]) = ColourCache::Entry(missColours[j], missOutputs[j]);
+            WritePacked(destination + missed[j] * pixelStride, missOutputs[j]);
+        }
+    }
+}
+
+// The cached kernel. Rows that meet no face box go through RunBatch; in rows
+// that do, pixels inside a box take the plain chain with the faces whose
+// boxes meet the row, in record order (the others cannot contain the pixel,
+// so the maximum over faces is unchanged), and the others the cache one by one.
 void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t rowBegin, size_t rowEnd,
                    size_t columnBegin, size_t columnEnd) {
     const TRANSFER& transfer = worker.transfer;
     const size_t faceCount = worker.faceBoxes ? std::min(worker.faceCount, transfer.faceCorrections.size()) : 0;
     const size_t pixelStride = worker.pixelStride;
     const LabByTables& toLab = LabByTables::Get();
+    const VectorKernel kernel = LabByTables::InUse();
     std::vector<FaceBox> rowBoxes;
     std::vector<FaceCorrection> rowFaces;
     rowBoxes.reserve(faceCount);
@@ -148,33 +249,34 @@ void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t
         const size_t offset = r * worker.rowStride + columnBegin * pixelStride;
         const uint8_t* in = worker.source + offset;
         uint8_t* out = worker.destination + offset;
+        if (rowBoxes.empty()) {
+            RunBatch(cache, kernel, transfer, in, out, columnEnd - columnBegin, pixelStride);
+            continue;
+        }
         for (size_t c = columnBegin; c < columnEnd; ++c, in += pixelStride, out += pixelStride) {
             const uint8_t red = in[0], green = in[1], blue = in[2];
-            if (!rowBoxes.empty()) {
-                const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
-                bool inside = false;
-                for (const FaceBox& box : rowBoxes) inside = inside || (px > box.xLow && px < box.xHigh);
-                if (inside) {
-                    const LabPixel lab = RgbToLab(red, green, blue);
-                    const float base = ToneCurveLookup(
-                        transfer.toneCurve,
-                        NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
-                    const ChromaPixel chroma =
-                        MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
-                    const float lightness = LiftFaces(rowBoxes.data(), rowFaces.data(), rowBoxes.size(), px, py,
-                                                      base, chroma.a, chroma.b);
-                    const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
-                    out[0] = rgb.red;
-                    out[1] = rgb.green;
-                    out[2] = rgb.blue;
-                    continue;
-                }
+            const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
+            bool inside = false;
+            for (const FaceBox& box : rowBoxes) inside = inside || (px > box.xLow && px < box.xHigh);
+            if (inside) {
+                const LabPixel lab = RgbToLab(red, green, blue);
+                const float base = ToneCurveLookup(
+                    transfer.toneCurve,
+                    NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
+                const ChromaPixel chroma =
+                    MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
+                const float lightness =
+                    LiftFaces(rowBoxes.data(), rowFaces.data(), rowBoxes.size(), px, py, base, chroma.a, chroma.b);
+                const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
+                out[0] = rgb.red;
+                out[1] = rgb.green;
+                out[2] = rgb.blue;
+                continue;
             }
-            const uint32_t key = static_cast<uint32_t>(red) << 16 | static_cast<uint32_t>(green) << 8 | blue;
-            const uint32_t rgb = cache.Get(key, [&] { return TransferColour(toLab, transfer, red, green, blue); });
-            out[0] = static_cast<uint8_t>(rgb >> 16);
-            out[1] = static_cast<uint8_t>(rgb >> 8);
-            out[2] = static_cast<uint8_t>(rgb);
+            const uint32_t colour = PackRgb(red, green, blue);
+            uint64_t& entry = cache.Slot(colour);
+            if (!ColourCache::Holds(entry, colour)) entry = ColourCache::Entry(colour, TransferColour(toLab, transfer, colour));
+            WritePacked(out, ColourCache::Output(entry));
         }
     }
 }

@@ -24,17 +24,22 @@ class ColourCache {
 public:
     explicit ColourCache(unsigned bits);  // 1 <= bits <= 31
 
-    template <class Compute>
-    uint32_t Get(uint32_t colour, Compute&& compute) {
-        uint64_t& entry = m_entries[(colour * 0x9E3779B1u) >> m_shift];
-        const uint32_t tag = colour | 0x80000000u;  // never 0, the empty entry
-        if (static_cast<uint32_t>(entry >> 32) == tag) return static_cast<uint32_t>(entry);
-        const uint32_t value = compute();
-        entry = static_cast<uint64_t>(tag) << 32 | value;
-        return value;
-    }
+    // The entry that `colour` (R << 16 | G << 8 | B) maps to: the top bits of
+    // colour x kMultiplier (mod 2^32) index the entries.
+    static constexpr uint32_t kMultiplier = 0x9E3779B1u;
+    static constexpr uint32_t kTagBit = 0x80000000u;
+    uint64_t& Slot(uint32_t colour) { return m_entries[(colour * kMultiplier) >> m_shift]; }
+    static bool Holds(uint64_t entry, uint32_t colour) { return static_cast<uint32_t>(entry >> 32) == Tag(colour); }
+    static uint32_t Output(uint64_t entry) { return static_cast<uint32_t>(entry); }
+    static uint64_t Entry(uint32_t colour, uint32_t output) { return static_cast<uint64_t>(Tag(colour)) << 32 | output; }
+
+    // For the vector lookup, which computes the index and tag the same way.
+    const uint64_t* Entries() const { return m_entries.data(); }
+    unsigned Shift() const { return m_shift; }
 
 private:
+    static uint32_t Tag(uint32_t colour) { return colour | kTagBit; }  // never 0, the empty entry
+
     unsigned m_shift;
     std::vector<uint64_t> m_entries;
 };

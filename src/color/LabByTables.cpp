@@ -2,8 +2,7 @@
 
 #include <stdexcept>
 
-#if !defined(VORA_FORCE_SCALAR) && defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
-#define VORA_AVX2_KERNEL 1
+#ifdef VORA_AVX2_KERNEL
 #include <immintrin.h>
 #endif
 
@@ -94,11 +93,11 @@ void LabByTables::Avx2Chroma(const uint8_t*, std::size_t, int, float*, int64_t*)
 
 #endif
 
-bool LabByTables::Available(ChromaKernel kernel) {
+bool LabByTables::Available(VectorKernel kernel) {
     switch (kernel) {
-    case ChromaKernel::Scalar:
+    case VectorKernel::Scalar:
         return true;
-    case ChromaKernel::Avx2:
+    case VectorKernel::Avx2:
 #ifdef VORA_AVX2_KERNEL
         return __builtin_cpu_supports("avx2");
 #else
@@ -108,21 +107,21 @@ bool LabByTables::Available(ChromaKernel kernel) {
     return false;
 }
 
-ChromaKernel LabByTables::InUse() {
-    static const ChromaKernel chosen = Available(ChromaKernel::Avx2) ? ChromaKernel::Avx2 : ChromaKernel::Scalar;
+VectorKernel LabByTables::InUse() {
+    static const VectorKernel chosen = Available(VectorKernel::Avx2) ? VectorKernel::Avx2 : VectorKernel::Scalar;
     return chosen;
 }
 
-const char* LabByTables::Name(ChromaKernel kernel) {
-    return kernel == ChromaKernel::Avx2 ? "avx2" : "scalar";
+const char* LabByTables::Name(VectorKernel kernel) {
+    return kernel == VectorKernel::Avx2 ? "avx2" : "scalar";
 }
 
-void LabByTables::ChromaOfPixels(ChromaKernel kernel, const uint8_t* pixels, std::size_t count, ChannelOrder order,
+void LabByTables::ChromaOfPixels(VectorKernel kernel, const uint8_t* pixels, std::size_t count, ChannelOrder order,
                                  float* pairs, int64_t* entryCounts) const {
     const int redOffset = order == ChannelOrder::Rgb ? 0 : 2;
-    if (kernel == ChromaKernel::Avx2 && Available(kernel))
+    if (kernel == VectorKernel::Avx2 && Available(kernel))
         Avx2Chroma(pixels, count, redOffset, pairs, entryCounts);
-    else if (kernel == ChromaKernel::Avx2)
+    else if (kernel == VectorKernel::Avx2)
         throw std::logic_error("the AVX2 colour kernel is not available here");
     else
         ScalarChroma(pixels, count, redOffset, pairs, entryCounts);

@@ -14,9 +14,13 @@
 
 namespace vora {
 
-// The ways ChromaOfPixels can run. Avx2 is compiled into x86-64 builds unless
-// VORA_FORCE_SCALAR is set, and used only where the processor has it.
-enum class ChromaKernel { Scalar, Avx2 };
+// The ways the colour kernels (ChromaOfPixels, TransferColours) can run. Avx2
+// is compiled into x86-64 builds unless VORA_FORCE_SCALAR is set, and used
+// only where the processor has it.
+enum class VectorKernel { Scalar, Avx2 };
+#if !defined(VORA_FORCE_SCALAR) && defined(__x86_64__) && (defined(__GNUC__) || defined(__clang__))
+#define VORA_AVX2_KERNEL 1
+#endif
 
 class LabByTables {
 public:
@@ -47,13 +51,13 @@ public:
 
     // The same with a chosen kernel, which must be Available (for the tests
     // and benchmarks, which hold every kernel to the scalar one).
-    void ChromaOfPixels(ChromaKernel kernel, const uint8_t* pixels, std::size_t count, ChannelOrder order,
+    void ChromaOfPixels(VectorKernel kernel, const uint8_t* pixels, std::size_t count, ChannelOrder order,
                         float* pairs, int64_t* entryCounts) const;
 
-    static bool Available(ChromaKernel kernel);
+    static bool Available(VectorKernel kernel);
     // The widest available kernel, chosen at first use.
-    static ChromaKernel InUse();
-    static const char* Name(ChromaKernel kernel);
+    static VectorKernel InUse();
+    static const char* Name(VectorKernel kernel);
 
 private:
     // One channel value's contributions to X, Y and Z; padded so that a row

@@ -7,6 +7,7 @@
 #include <utility>
 #include <vector>
 
+#include <opencv2/imgproc.hpp>
 #include <tbb/global_control.h>
 
 #include "color/ApplyTransfer.h"
@@ -109,6 +110,11 @@ TEST(ApplyTransfer, CachedKernelGivesThePlainKernelsBytesForEveryColour) {
         ASSERT_GT(DifferentBytes(plain, all), all.rows * all.cols);  // the transfer shows
         EXPECT_EQ(DifferentBytes(Applied(all, transfer), plain), 0) << transfer.faceCorrections.size() << " faces";
     }
+    // Four-byte pixels take the scalar lookup (three-byte ones the vector one where there is one).
+    cv::Mat four;
+    cv::cvtColor(all, four, cv::COLOR_RGB2RGBA);
+    EXPECT_EQ(DifferentBytes(Applied(four, Transfers()[kSteep]), Applied(four, Transfers()[kSteep], ApplyKernel::Plain)),
+              0);
 }
 
 // A photo whose colours repeat (cache hits and evictions) and whose tilings

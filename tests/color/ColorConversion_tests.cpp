@@ -44,7 +44,7 @@ TEST(ColorConversion, EveryChromaKernelEqualsTheReferenceForEveryColour) {
         expectedPairs[2 * size_t{rgb}] = lab.a, expectedPairs[2 * size_t{rgb} + 1] = lab.b;
         ++expectedCounts[entry];
     }
-    for (ChromaKernel kernel : {ChromaKernel::Scalar, ChromaKernel::Avx2}) {
+    for (VectorKernel kernel : {VectorKernel::Scalar, VectorKernel::Avx2}) {
         if (!LabByTables::Available(kernel)) continue;
         for (ChannelOrder order : {ChannelOrder::Rgb, ChannelOrder::Bgr}) {
             SCOPED_TRACE(std::string(LabByTables::Name(kernel)) + (order == ChannelOrder::Rgb ? " rgb" : " bgr"));
@@ -70,14 +70,14 @@ TEST(ColorConversion, EveryChromaKernelEqualsTheReferenceForEveryColour) {
 // with VORA_FORCE_SCALAR has none but the scalar one.
 TEST(ColorConversion, WidestAvailableChromaKernelIsUsed) {
 #ifdef VORA_FORCE_SCALAR
-    EXPECT_FALSE(LabByTables::Available(ChromaKernel::Avx2));
-    EXPECT_EQ(LabByTables::InUse(), ChromaKernel::Scalar);
+    EXPECT_FALSE(LabByTables::Available(VectorKernel::Avx2));
+    EXPECT_EQ(LabByTables::InUse(), VectorKernel::Scalar);
 #else
 #if defined(__x86_64__)
-    EXPECT_EQ(LabByTables::Available(ChromaKernel::Avx2), static_cast<bool>(__builtin_cpu_supports("avx2")));
+    EXPECT_EQ(LabByTables::Available(VectorKernel::Avx2), static_cast<bool>(__builtin_cpu_supports("avx2")));
 #endif
     EXPECT_EQ(LabByTables::InUse(),
-              LabByTables::Available(ChromaKernel::Avx2) ? ChromaKernel::Avx2 : ChromaKernel::Scalar);
+              LabByTables::Available(VectorKernel::Avx2) ? VectorKernel::Avx2 : VectorKernel::Scalar);
 #endif
 }
 
