@@ -77,16 +77,9 @@ Status ComputeTransfers(const Engine& engine, const IImage& content, std::vector
 
 Status ComputeTransferToStyleImage(const IImage& content, const IImage& style, TRANSFER& out,
                                    const VoraParameters& params) {
-    // A summary's second step sums in image order on one thread; the style's
-    // first step runs beside it, and the content's chroma is freed before
-    // the style's is complete, so the two never hold all of theirs at once.
     ColourStats contentStats{};
     ColourStats styleStats{};
-    PendingSummaryPtr pendingContent = BeginSummary(RgbView(&content), ChannelOrder::Rgb);
-    PendingSummaryPtr pendingStyle;
-    tbb::parallel_invoke([&] { FinishSummary(std::move(pendingContent), contentStats); },
-                         [&] { pendingStyle = BeginSummary(RgbView(&style), ChannelOrder::Rgb); });
-    FinishSummary(std::move(pendingStyle), styleStats);
+    SummariseColourPair(RgbView(&content), RgbView(&style), ChannelOrder::Rgb, contentStats, styleStats);
 
     TRANSFER solved = out;
     solved.clusterIndex = -1;

@@ -7,7 +7,6 @@
 #include <cstdint>
 #include <cstring>
 #include <cstdlib>
-#include <memory>
 #include <new>
 #include <utility>
 #include <vector>
@@ -152,10 +151,12 @@ constexpr size_t kBandPixels = size_t{1} << 16;
 // the image's chroma pairs (a*, b*), and counted by lightness table entry;
 // each band is then handed, in image order, to one consumer, which forms the
 // sequential sums OpenCV forms (their bits are the statistics' bits) while
-// later bands are still being converted.
-template <class Consume>
+// later bands are still being converted. release(end) is called in image
+// order before a band's pairs, which end at pair `end`, are written: the
+// buffer may still hold another image's pairs that are being read.
+template <class Release, class Consume>
 void ConvertInBands(const cv::Mat& pixels8, ChannelOrder order, float* pairs, std::vector<int64_t>& entryCounts,
-                    Consume&& consume) {
+                    Release&& release, Consume&& consume) {
     const int columns = pixels8.cols;
     const int bandRows = static_cast<int>(std::max<size_t>(1, kBandPixels / static_cast<size_t>(columns)));
     const int bands = (pixels8.rows + bandRows - 1) / bandRows;
@@ -169,7 +170,11 @@ void ConvertInBands(const cv::Mat& pixels8, ChannelOrder order, float* pairs, st
         static_cast<size_t>(2 * tbb::this_task_arena::max_concurrency()),
         tbb::make_filter<void, int>(tbb::filter_mode::serial_in_order,
                                     [&](tbb::flow_control& control) {
-                                        if (next == bands) control.stop();
+                                        if (next == bands) {
+                                            control.stop();
+                                            return next;
+                                        }
+                                        release(std::min(total, bandPixels * static_cast<size_t>(next + 1)));
                                         return next++;
                                     }) &
             tbb::make_filter<int, int>(
@@ -232,10 +237,12 @@ struct CentredProducts {
     double aa, ab, bb;
 };
 
-// Kept out of line: inlined into its caller, GCC keeps the three sums in
-// memory, which adds a store and a load to each addition this loop waits on.
-[[gnu::noinline]] CentredProducts SumCentredProducts(const float* pairs, size_t count, float meanA, float meanB) {
-    double aa = 0.0, ab = 0.0, bb = 0.0;
+// Continues `sums` over the next `count` pairs. Kept out of line: inlined
+// into its caller, GCC keeps the three sums in memory, which adds a store and
+// a load to each addition this loop waits on.
+[[gnu::noinline]] CentredProducts SumCentredProducts(const float* pairs, size_t count, float meanA, float meanB,
+                                                     CentredProducts sums) {
+    double aa = sums.aa, ab = sums.ab, bb = sums.bb;
     for (const float* const end = pairs + 2 * count; pairs != end; pairs += 2) {
         const double a = pairs[0] - meanA;
         const double b = pairs[1] - meanB;
@@ -244,6 +251,63 @@ struct CentredProducts {
         bb += b * b;
     }
     return {aa, ab, bb};
+}
+
+// What the second pass and the lightness statistics need from the first.
+struct FirstPassResult {
+    size_t pixels = 0;
+    float meanA = 0.0f, meanB = 0.0f;
+    std::vector<int64_t> entryCounts;
+};
+
+// Converts the image into `pairs` (room for 2 x its pixels) and forms the
+// chroma means as OpenCV's row reduction does: float sums in image order
+// from the first pixel on, times the float of 1/n, plus a zero offset.
+template <class Release>
+FirstPassResult FirstPass(const cv::Mat& pixels8, ChannelOrder order, float* pairs, Release&& release) {
+    FirstPassResult result;
+    result.pixels = pixels8.total();
+    float sumA = 0.0f, sumB = 0.0f;
+    bool first = true;
+    ConvertInBands(pixels8, order, pairs, result.entryCounts, release, [&](const float* band, size_t count) {
+        if (first) {
+            sumA = band[0];
+            sumB = band[1];
+            first = false;
+            AddPairs(band + 2, count - 1, sumA, sumB);
+        } else {
+            AddPairs(band, count, sumA, sumB);
+        }
+    });
+    const float scale = static_cast<float>(1.0 / (pixels8.rows * pixels8.cols));
+    result.meanA = sumA * scale + 0.0f;
+    result.meanB = sumB * scale + 0.0f;
+    return result;
+}
+
+void NothingToRelease(size_t) {}
+
+// Fills stats from the first pass and the second pass's sums: the products
+// of the centred values (float differences, exact products in double) summed
+// in image order, as OpenCV's transposed product forms each entry of the
+// upper triangle.
+void FinishStats(const FirstPassResult& pass, const CentredProducts& sums, ColourStats& stats) {
+    const double sampleScale = 1.0 / static_cast<int>(pass.pixels);
+    cv::Mat covariance(2, 2, CV_32F);
+    covariance.at<float>(0, 0) = static_cast<float>(sums.aa * sampleScale);
+    covariance.at<float>(0, 1) = covariance.at<float>(1, 0) = static_cast<float>(sums.ab * sampleScale);
+    covariance.at<float>(1, 1) = static_cast<float>(sums.bb * sampleScale);
+
+    stats.chromaMean[0] = pass.meanA;
+    stats.chromaMean[1] = pass.meanB;
+    cv::Mat root;
+    MatrixSqrt(covariance, root);
+    for (int i = 0; i < 4; ++i) stats.chromaSqrtCov[i] = root.at<float>(i / 2, i % 2);
+
+    const LightnessLevels& levels = Levels();
+    std::vector<int64_t> counts(levels.Count(), 0);
+    for (size_t entry = 0; entry < kTableSize; ++entry) counts[levels.LevelOfEntry(entry)] += pass.entryCounts[entry];
+    LightnessStatsFromCounts(counts, stats);
 }
 
 }  // namespace
@@ -272,71 +336,43 @@ void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrder order) {
     });
 }
 
-// Everything the second step needs from the first.
-struct PendingSummary {
-    explicit PendingSummary(size_t pixels) : pixels(pixels), pairs(2 * pixels) {}
-    size_t pixels;
-    PairBuffer pairs;  // every pixel's (a*, b*): 8 bytes a pixel
-    float meanA = 0.0f, meanB = 0.0f;
-    std::vector<int64_t> entryCounts;
-};
-
-void PendingSummaryDeleter::operator()(PendingSummary* pending) const { delete pending; }
-
-PendingSummaryPtr BeginSummary(const cv::Mat& pixels8, ChannelOrder order) {
-    CV_Assert(pixels8.type() == CV_8UC3 && !pixels8.empty());
-    PendingSummaryPtr pending(new PendingSummary(pixels8.total()));
-
-    // The chroma sums in image order, in float, from the first pixel on, as
-    // OpenCV's row reduction forms them.
-    float sumA = 0.0f, sumB = 0.0f;
-    bool first = true;
-    ConvertInBands(pixels8, order, pending->pairs.get(), pending->entryCounts, [&](const float* band, size_t count) {
-        if (first) {
-            sumA = band[0];
-            sumB = band[1];
-            first = false;
-            AddPairs(band + 2, count - 1, sumA, sumB);
-        } else {
-            AddPairs(band, count, sumA, sumB);
-        }
-    });
-    // The average: the float sum times the float of 1/n, plus a zero offset.
-    const int pixels = pixels8.rows * pixels8.cols;
-    const float scale = static_cast<float>(1.0 / pixels);
-    pending->meanA = sumA * scale + 0.0f;
-    pending->meanB = sumB * scale + 0.0f;
-    return pending;
-}
-
-void FinishSummary(PendingSummaryPtr pending, ColourStats& stats) {
-    CV_Assert(pending != nullptr);
-    // The products of the centred values (float differences, exact products
-    // in double) summed in image order, as OpenCV's transposed product forms
-    // each entry of the upper triangle.
-    const CentredProducts sums = SumCentredProducts(pending->pairs.get(), pending->pixels, pending->meanA, pending->meanB);
-    const double sampleScale = 1.0 / static_cast<int>(pending->pixels);
-    cv::Mat covariance(2, 2, CV_32F);
-    covariance.at<float>(0, 0) = static_cast<float>(sums.aa * sampleScale);
-    covariance.at<float>(0, 1) = covariance.at<float>(1, 0) = static_cast<float>(sums.ab * sampleScale);
-    covariance.at<float>(1, 1) = static_cast<float>(sums.bb * sampleScale);
-
-    stats.chromaMean[0] = pending->meanA;
-    stats.chromaMean[1] = pending->meanB;
-    cv::Mat root;
-    MatrixSqrt(covariance, root);
-    for (int i = 0; i < 4; ++i) stats.chromaSqrtCov[i] = root.at<float>(i / 2, i % 2);
-
-    const LightnessLevels& levels = Levels();
-    std::vector<int64_t> counts(levels.Count(), 0);
-    for (size_t entry = 0; entry < kTableSize; ++entry)
-        counts[levels.LevelOfEntry(entry)] += pending->entryCounts[entry];
-    pending.reset();  // the pairs go before the lightness statistics allocate
-    LightnessStatsFromCounts(counts, stats);
-}
-
 void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats) {
-    FinishSummary(BeginSummary(pixels8, order), stats);
+    CV_Assert(pixels8.type() == CV_8UC3 && !pixels8.empty());
+    FirstPassResult pass;
+    CentredProducts sums{};
+    {
+        const PairBuffer pairs(2 * pixels8.total());
+        pass = FirstPass(pixels8, order, pairs.get(), NothingToRelease);
+        sums = SumCentredProducts(pairs.get(), pass.pixels, pass.meanA, pass.meanB, sums);
+    }  // the pairs go before the lightness statistics allocate
+    FinishStats(pass, sums, stats);
+}
+
+void SummariseColourPair(const cv::Mat& first, const cv::Mat& second, ChannelOrder order, ColourStats& firstStats,
+                         ColourStats& secondStats) {
+    CV_Assert(first.type() == CV_8UC3 && !first.empty() && second.type() == CV_8UC3 && !second.empty());
+    FirstPassResult firstPass, secondPass;
+    CentredProducts firstSums{}, secondSums{};
+    {
+        // One buffer for both: the first image's second pass reads its pairs
+        // just ahead of the second image's conversion overwriting them, so
+        // the pages are faulted in once and half the memory is enough.
+        const PairBuffer pairs(2 * std::max(first.total(), second.total()));
+        firstPass = FirstPass(first, order, pairs.get(), NothingToRelease);
+        size_t summed = 0;  // the first image's pairs already in firstSums
+        const auto sumFirstUpTo = [&](size_t end) {
+            end = std::min(end, firstPass.pixels);
+            if (end <= summed) return;
+            firstSums = SumCentredProducts(pairs.get() + 2 * summed, end - summed, firstPass.meanA, firstPass.meanB,
+                                           firstSums);
+            summed = end;
+        };
+        secondPass = FirstPass(second, order, pairs.get(), sumFirstUpTo);
+        sumFirstUpTo(firstPass.pixels);
+        secondSums = SumCentredProducts(pairs.get(), secondPass.pixels, secondPass.meanA, secondPass.meanB, secondSums);
+    }
+    FinishStats(firstPass, firstSums, firstStats);
+    FinishStats(secondPass, secondSums, secondStats);
 }
 
 int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats) {

@@ -1,7 +1,5 @@
 #pragma once
 
-#include <memory>
-
 #include <opencv2/core.hpp>
 
 #include "KitApi.h"
@@ -37,17 +35,12 @@ VORA_KIT_API void ConvertToLab(const cv::Mat& pixels8, cv::Mat& lab, ChannelOrde
 // pixel.
 VORA_KIT_API void SummariseColours(const cv::Mat& pixels8, ChannelOrder order, ColourStats& stats);
 
-// The same in two steps, for a caller that runs one image's second step
-// beside another's first: BeginSummary converts the pixels on all threads
-// and keeps their chroma; FinishSummary sums it again on the calling thread,
-// frees it and fills stats.
-struct PendingSummary;
-struct PendingSummaryDeleter {
-    void operator()(PendingSummary* pending) const;
-};
-using PendingSummaryPtr = std::unique_ptr<PendingSummary, PendingSummaryDeleter>;
-VORA_KIT_API PendingSummaryPtr BeginSummary(const cv::Mat& pixels8, ChannelOrder order);
-VORA_KIT_API void FinishSummary(PendingSummaryPtr pending, ColourStats& stats);
+// The same for two images at once, as two calls would give them, with one
+// chroma buffer of 8 bytes a pixel of the larger image: the first image's
+// second pass runs on one thread while the second image is converted on the
+// others, just behind it. Both must hold at least one pixel.
+VORA_KIT_API void SummariseColourPair(const cv::Mat& first, const cv::Mat& second, ChannelOrder order,
+                                      ColourStats& firstStats, ColourStats& secondStats);
 
 // Entries 0..5. The image must hold at least one pixel. Returns 0.
 VORA_KIT_API int ComputeChromaStats(const cv::Mat& lab, ColourStats& stats);
