@@ -14,18 +14,6 @@
 namespace vora {
 namespace {
 
-// The table form gives the reference conversion's bits for every 24-bit
-// colour, lightness entry included.
-TEST(ColorConversion, TableFormEqualsTheReferenceForEveryColour) {
-    const LabByTables& tables = LabByTables::Get();
-    for (uint32_t rgb = 0; rgb < (1u << 24); ++rgb) {
-        size_t expectedEntry = 0, entry = 1;
-        const LabPixel expected = RgbToLab(rgb >> 16, (rgb >> 8) & 255, rgb & 255, expectedEntry);
-        const LabPixel lab = tables(rgb >> 16, (rgb >> 8) & 255, rgb & 255, entry);
-        ASSERT_TRUE(std::memcmp(&lab, &expected, sizeof lab) == 0 && entry == expectedEntry) << std::hex << rgb;
-    }
-}
-
 // Every kernel this machine can run gives the reference's a*, b* and lightness
 // entries for every 24-bit colour, in both byte orders. Runs are cut at odd
 // lengths so that the vector kernels' scalar tails and unaligned starts are

@@ -1,7 +1,6 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
-#include <utility>
 
 #include "color/ColorTables.h"
 
@@ -18,11 +17,6 @@ TEST(ColorTables, EveryEntryIsItsDoubleFormulaRoundedToFloat) {
         ASSERT_EQ(inverseGammaTable[i], static_cast<float>(std::pow(x, 1.0 / 2.2))) << i;
         ASSERT_EQ(labTable[i], static_cast<float>(x > 0.008856 ? std::cbrt(x) : 7.787037 * x + 16.0 / 116.0)) << i;
     }
-}
-
-TEST(ColorTables, LookupRoundsHalvesUpward) {
-    const std::pair<float, size_t> cases[] = {{0.0f, 0}, {1.0f, 3000}, {0.5f / 3000.0f, 1}, {0.49f / 3000.0f, 0}};
-    for (const auto& [value, index] : cases) EXPECT_EQ(TableIndex(value), index) << value;
 }
 
 }  // namespace

@@ -58,15 +58,6 @@ TEST(SolveTransfer, FloorActsOnEveryEntry) {
     EXPECT_LE(cv::norm(floored - cv::Matx22f(25, 6, 6, 18) * 0.05f, cv::NORM_INF), 1e-5);
 }
 
-TEST(FitToneCurve, CoarseGridIsSevenByEightWithoutNominalEnds) {
-    const std::vector<ToneGridPoint> grid = ToneCoarseGrid();
-    ASSERT_EQ(grid.size(), 56u);
-    for (size_t k = 0; k < grid.size(); ++k) {  // a-major: the width runs fastest
-        EXPECT_NEAR(grid[k].centre, 0.1 * (k / 8), 1e-6) << k;
-        EXPECT_NEAR(grid[k].width, 0.2 + 0.1 * (k % 8), 1e-6) << k;
-    }
-}
-
 TEST(FitToneCurve, TargetsLimitTheLargestMoveToPointTwo) {
     ColourStats style = kGrey;
     const float* c = kGrey.lightness;
