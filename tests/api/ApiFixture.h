@@ -1,7 +1,7 @@
 #pragma once
 
-// The api tests' common ground: a random fixture database, a synthetic photo
-// and default parameters.
+// The api tests' common ground: a random fixture database, a synthetic photo,
+// default parameters and a compute run that checks a refusal writes nothing.
 #include <gtest/gtest.h>
 
 #include <opencv2/core.hpp>
@@ -24,6 +24,17 @@ protected:
     static vora_api Api(const fixtures::FixtureOptions& options) {
         const fixtures::ModelFixture model(options);
         return vora_api(model.modelDir());
+    }
+
+    // Runs compute_transfers into a vector of n + 1 marked records: a refusal leaves every mark.
+    Status Compute(const fixtures::FixtureOptions& database, uint64_t n = 5) {
+        vora_api api = Api(database);
+        params.numTransfers = n;
+        std::vector<TRANSFER> out(n + 1);
+        for (TRANSFER& t : out) t.styleIndex = 777;
+        const Status status = api.compute_transfers(content.get(), out, params);
+        for (const TRANSFER& t : out) EXPECT_TRUE(status == STATUS_OK || t.styleIndex == 777);
+        return status;
     }
 };
 

@@ -98,7 +98,10 @@ void WriteFixtureNetwork(const std::string& folder, const NetworkOptions& option
         WriteBytes(folder + "mean.binaryproto",
                    SerializeBlob({{1, 3, kSize, kSize}, {mean.begin<float>(), mean.end<float>()}}));
     }
-    if (options.files == Files::MissingWeights) std::filesystem::remove(folder + kNetworkWeightsName);
+    if (options.files == Files::MissingWeights || options.files == Files::WeightsFolder)
+        std::filesystem::remove(folder + kNetworkWeightsName);
+    if (options.files == Files::WeightsFolder) std::filesystem::create_directory(folder + kNetworkWeightsName);
+    if (options.files == Files::EmptyWeights) WriteBytes(folder + kNetworkWeightsName, "");
     if (options.files == Files::GarbledDefinition) WriteBytes(folder + kNetworkDefinitionName, "layer {\n  type: {{\n");
     if (options.files == Files::GarbledWeights)  // a length-delimited field claiming far more bytes than follow
         WriteBytes(folder + kNetworkWeightsName, std::string("\x0a\xff\xff\xff\x0f", 5) + "garbage");

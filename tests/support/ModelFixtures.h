@@ -31,8 +31,9 @@ void TruncateFile(const std::string& path, size_t size);
 void WriteDataFile(const std::string& path, const std::vector<int32_t>& header, const std::vector<float>& values);
 
 struct NetworkOptions {
-    // None: no network folder; MissingWeights: only the definition; Garbled*: a file that does not parse.
-    enum class Files { Valid, None, MissingWeights, GarbledDefinition, GarbledWeights };
+    // None: no network folder; MissingWeights: only the definition; Garbled*: a file that does not parse;
+    // EmptyWeights: a weights file of no bytes; WeightsFolder: a folder where the weights file belongs.
+    enum class Files { Valid, None, MissingWeights, GarbledDefinition, GarbledWeights, EmptyWeights, WeightsFolder };
     Files files = Files::Valid;
 
     // false: a plain input "data" of 1 x 3 x 256 x 256, fed raw pixel values.

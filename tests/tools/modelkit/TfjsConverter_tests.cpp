@@ -5,7 +5,7 @@
 #include <fstream>
 #include <type_traits>
 
-#include <gtest/gtest.h>
+#include <gmock/gmock.h>
 #include <nlohmann/json.hpp>
 
 #include "KitTesting.h"
@@ -16,6 +16,7 @@
 namespace {
 
 using json = nlohmann::json;
+using testing::HasSubstr;
 using kit_testing::TempDir;
 using vora::modelkit::ConversionError;
 using vora::modelkit::ConvertTfjs;
@@ -192,9 +193,8 @@ TEST(TfjsConverter, RefusesCropsWhoseSizesTheNetworkFormatCannotKeep) {
     Graph same;
     same.Input("image", {1, 416, 416, 3}).Conv("conv", "image", {3, 3, 3, 1}, std::vector<float>(27, 1.0f), "SAME", 2);
     const std::string sameModel = same.Write(dir.path);
-    const std::string sameRefusal = RefusalOf(Options(sameModel, "conv", 1, 32));
-    EXPECT_NE(sameRefusal.find("pads 0 before and 1 after on an input of 32"), std::string::npos) << sameRefusal;
-    EXPECT_NE(sameRefusal.find("227"), std::string::npos) << sameRefusal;
+    EXPECT_THAT(RefusalOf(Options(sameModel, "conv", 1, 32)),
+                testing::AllOf(HasSubstr("pads 0 before and 1 after on an input of 32"), HasSubstr("227")));
     EXPECT_NO_THROW(ConvertTfjs(Options(sameModel, "conv", 1, 33)));
 
     TempDir dir2;
@@ -206,9 +206,8 @@ TEST(TfjsConverter, RefusesCropsWhoseSizesTheNetworkFormatCannotKeep) {
              {"ksize", {{"list", {{"i", {"1", "3", "3", "1"}}}}}},
              {"strides", {{"list", {{"i", {"1", "2", "2", "1"}}}}}}});
     const std::string poolModel = pool.Write(dir2.path);
-    const std::string poolRefusal = RefusalOf(Options(poolModel, "pool", 1, 34));
-    EXPECT_NE(poolRefusal.find("gives 16 from 34, but the network format would give 17"), std::string::npos)
-        << poolRefusal;
+    EXPECT_THAT(RefusalOf(Options(poolModel, "pool", 1, 34)),
+                HasSubstr("gives 16 from 34, but the network format would give 17"));
     EXPECT_NO_THROW(ConvertTfjs(Options(poolModel, "pool", 1, 33)));
 }
 
@@ -230,19 +229,15 @@ TEST(TfjsConverter, RefusalsNameTheirCause) {
         {Options(model, "conv", 2, 228), "the crop must be 1 to 227"},
         {Options(model, "added", 3), "must fold into a first convolution"},
     };
-    for (const auto& c : cases) {
-        const std::string refusal = RefusalOf(c.options);
-        EXPECT_NE(refusal.find(c.mentions), std::string::npos) << refusal;
-    }
+    for (const auto& c : cases) EXPECT_THAT(RefusalOf(c.options), HasSubstr(c.mentions));
 
     TempDir truncated;
-    EXPECT_NE(RefusalOf(Options(g.Write(truncated.path, 1), "conv", 2)).find("truncated shard"), std::string::npos);
+    EXPECT_THAT(RefusalOf(Options(g.Write(truncated.path, 1), "conv", 2)), HasSubstr("truncated shard"));
 
     TempDir strings;
     Graph s;
     s.Input("image", {1, 416, 416, 3}).Stored("names", {1}, "string", "abcd", json());
-    EXPECT_NE(RefusalOf(Options(s.Write(strings.path), "image", 3)).find("weight names has dtype string"),
-              std::string::npos);
+    EXPECT_THAT(RefusalOf(Options(s.Write(strings.path), "image", 3)), HasSubstr("weight names has dtype string"));
 }
 
 }  // namespace
