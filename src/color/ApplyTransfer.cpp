@@ -219,16 +219,43 @@ void RunBatch(ColourCache& cache, VectorKernel kernel, const TRANSFER& transfer,
     }
 }
 
+// A run of `count` pixels of one row, from column `column` on, inside the
+// boxes of `faces` (those that meet the row): the plain kernel's chain,
+// evaluated as TransferColours does with each pixel's face lift between the
+// transfer and the conversion back to RGB. Each batch's colours are read
+// before any pixel is written, so in place is safe.
+void RunLiftedBatch(const ApplyTransferWorker& worker, const std::vector<FaceBox>& boxes,
+                    const std::vector<FaceCorrection>& faces, float py, VectorKernel kernel, const uint8_t* in,
+                    uint8_t* out, size_t column, size_t count) {
+    uint32_t colours[kBatch], outputs[kBatch];
+    float px[kBatch];
+    const size_t pixelStride = worker.pixelStride;
+    const LightnessLift lift = [&](size_t first, size_t n, float* lightness, const float* a, const float* b) {
+        for (size_t i = 0; i < n; ++i)
+            lightness[i] = LiftFaces(boxes.data(), faces.data(), boxes.size(), px[first + i], py, lightness[i], a[i],
+                                     b[i]);
+    };
+    for (size_t done = 0; done < count; done += kBatch) {
+        const size_t n = std::min(kBatch, count - done);
+        for (size_t i = 0; i < n; ++i) {
+            const uint8_t* pixel = in + (done + i) * pixelStride;
+            colours[i] = PackRgb(pixel[0], pixel[1], pixel[2]);
+            px[i] = FullImagePosition(worker.tileLeft, column + done + i, worker.fullWidth);
+        }
+        TransferColours(kernel, worker.transfer, colours, n, outputs, lift);
+        for (size_t i = 0; i < n; ++i) WritePacked(out + (done + i) * pixelStride, outputs[i]);
+    }
+}
+
 // The cached kernel. Rows that meet no face box go through RunBatch; in rows
-// that do, pixels inside a box take the plain chain with the faces whose
-// boxes meet the row, in record order (the others cannot contain the pixel,
-// so the maximum over faces is unchanged), and the others the cache one by one.
+// that do, pixels inside a box take the chain with the faces whose boxes meet
+// the row, in record order (the others cannot contain the pixel, so the
+// maximum over faces is unchanged), and runs of the others RunBatch.
 void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t rowBegin, size_t rowEnd,
                    size_t columnBegin, size_t columnEnd) {
     const TRANSFER& transfer = worker.transfer;
     const size_t faceCount = worker.faceBoxes ? std::min(worker.faceCount, transfer.faceCorrections.size()) : 0;
     const size_t pixelStride = worker.pixelStride;
-    const LabByTables& toLab = LabByTables::Get();
     const VectorKernel kernel = LabByTables::InUse();
     std::vector<FaceBox> rowBoxes;
     std::vector<FaceCorrection> rowFaces;
@@ -253,30 +280,24 @@ void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t
             RunBatch(cache, kernel, transfer, in, out, columnEnd - columnBegin, pixelStride);
             continue;
         }
-        for (size_t c = columnBegin; c < columnEnd; ++c, in += pixelStride, out += pixelStride) {
-            const uint8_t red = in[0], green = in[1], blue = in[2];
+        // Runs of pixels outside every box go through RunBatch; runs inside
+        // take the chain with the faces' lift, also in batches.
+        const auto inside = [&](size_t c) {
             const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
-            bool inside = false;
-            for (const FaceBox& box : rowBoxes) inside = inside || (px > box.xLow && px < box.xHigh);
-            if (inside) {
-                const LabPixel lab = RgbToLab(red, green, blue);
-                const float base = ToneCurveLookup(
-                    transfer.toneCurve,
-                    NormaliseLightness(lab.lightness01, transfer.lightnessLow, transfer.lightnessHigh));
-                const ChromaPixel chroma =
-                    MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
-                const float lightness =
-                    LiftFaces(rowBoxes.data(), rowFaces.data(), rowBoxes.size(), px, py, base, chroma.a, chroma.b);
-                const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
-                out[0] = rgb.red;
-                out[1] = rgb.green;
-                out[2] = rgb.blue;
-                continue;
-            }
-            const uint32_t colour = PackRgb(red, green, blue);
-            uint64_t& entry = cache.Slot(colour);
-            if (!ColourCache::Holds(entry, colour)) entry = ColourCache::Entry(colour, TransferColour(toLab, transfer, colour));
-            WritePacked(out, ColourCache::Output(entry));
+            for (const FaceBox& box : rowBoxes)
+                if (px > box.xLow && px < box.xHigh) return true;
+            return false;
+        };
+        for (size_t c = columnBegin; c < columnEnd;) {
+            const bool lifted = inside(c);
+            size_t end = c + 1;
+            while (end < columnEnd && inside(end) == lifted) ++end;
+            const size_t skip = (c - columnBegin) * pixelStride;
+            if (lifted)
+                RunLiftedBatch(worker, rowBoxes, rowFaces, py, kernel, in + skip, out + skip, c, end - c);
+            else
+                RunBatch(cache, kernel, transfer, in + skip, out + skip, end - c, pixelStride);
+            c = end;
         }
     }
 }

@@ -28,7 +28,8 @@ void LabStage(const uint32_t* colours, std::size_t count, float* lightness, floa
     }
 }
 
-void ScalarColours(const TRANSFER& transfer, const uint32_t* colours, std::size_t count, uint32_t* outputs) {
+void ScalarColours(const TRANSFER& transfer, const uint32_t* colours, std::size_t count, uint32_t* outputs,
+                   const LightnessLift* lift) {
     float lightness[kRun], a[kRun], b[kRun];
     for (std::size_t done = 0; done < count; done += kRun) {
         const std::size_t n = std::min(kRun, count - done);
@@ -41,6 +42,7 @@ void ScalarColours(const TRANSFER& transfer, const uint32_t* colours, std::size_
             a[i] = chroma.a;
             b[i] = chroma.b;
         }
+        if (lift != nullptr) (*lift)(done, n, lightness, a, b);
         for (std::size_t i = 0; i < n; ++i) {
             const Rgb8 rgb = LabToRgb(lightness[i], a[i], b[i]);
             outputs[done + i] = PackRgb(rgb.red, rgb.green, rgb.blue);
@@ -151,7 +153,7 @@ VORA_AVX2 inline __m256i RgbLanes(const float* lightness, const float* a, const 
 // gathers); a run is padded to whole lanes with black, whose outputs are
 // dropped.
 VORA_AVX2 void Avx2Colours(const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
-                           uint32_t* outputs) {
+                           uint32_t* outputs, const LightnessLift* lift) {
     alignas(32) float lightness[kRun], a[kRun], b[kRun];
     alignas(32) uint32_t packed[kRun];
     for (std::size_t done = 0; done < count; done += kRun) {
@@ -162,6 +164,7 @@ VORA_AVX2 void Avx2Colours(const TRANSFER& transfer, const uint32_t* colours, st
         std::fill(a + n, a + lanes, 0.0f);
         std::fill(b + n, b + lanes, 0.0f);
         for (std::size_t i = 0; i < lanes; i += 8) TransferLanes(transfer, lightness + i, a + i, b + i);
+        if (lift != nullptr) (*lift)(done, n, lightness, a, b);
         for (std::size_t i = 0; i < lanes; i += 8)
             _mm256_store_si256(reinterpret_cast<__m256i*>(packed + i), RgbLanes(lightness + i, a + i, b + i));
         std::memcpy(outputs + done, packed, n * sizeof(uint32_t));
@@ -172,7 +175,7 @@ VORA_AVX2 void Avx2Colours(const TRANSFER& transfer, const uint32_t* colours, st
 
 #else
 
-void Avx2Colours(const TRANSFER&, const uint32_t*, std::size_t, uint32_t*) {
+void Avx2Colours(const TRANSFER&, const uint32_t*, std::size_t, uint32_t*, const LightnessLift*) {
     throw std::logic_error("the AVX2 colour kernel is not in this build");
 }
 
@@ -183,9 +186,17 @@ void Avx2Colours(const TRANSFER&, const uint32_t*, std::size_t, uint32_t*) {
 void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
                      uint32_t* outputs) {
     if (kernel == VectorKernel::Avx2)
-        Avx2Colours(transfer, colours, count, outputs);
+        Avx2Colours(transfer, colours, count, outputs, nullptr);
     else
-        ScalarColours(transfer, colours, count, outputs);
+        ScalarColours(transfer, colours, count, outputs, nullptr);
+}
+
+void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
+                     uint32_t* outputs, const LightnessLift& lift) {
+    if (kernel == VectorKernel::Avx2)
+        Avx2Colours(transfer, colours, count, outputs, &lift);
+    else
+        ScalarColours(transfer, colours, count, outputs, &lift);
 }
 
 }  // namespace vora

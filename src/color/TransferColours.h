@@ -6,6 +6,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 
 #include <vora/vora.h>
 
@@ -41,5 +42,16 @@ inline uint32_t TransferColour(const LabByTables& toLab, const TRANSFER& transfe
 // Available.
 void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
                      uint32_t* outputs);
+
+// Rewrites lightness[0, count) of colours [first, first + count) of a call,
+// given their lightness after the tone curve and their mapped chroma a, b.
+using LightnessLift =
+    std::function<void(std::size_t first, std::size_t count, float* lightness, const float* a, const float* b)>;
+
+// The same with `lift` applied between the transfer and the conversion back
+// to RGB, where the plain kernel lifts faces: pixels inside face boxes take
+// this form, their colours and positions side by side.
+void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
+                     uint32_t* outputs, const LightnessLift& lift);
 
 }  // namespace vora
