@@ -242,7 +242,7 @@ void RunLiftedBatch(const ApplyTransferWorker& worker, const std::vector<FaceBox
             colours[i] = PackRgb(pixel[0], pixel[1], pixel[2]);
             px[i] = FullImagePosition(worker.tileLeft, column + done + i, worker.fullWidth);
         }
-        TransferColours(kernel, worker.transfer, colours, n, outputs, lift);
+        TransferColours(kernel, worker.transfer, colours, n, outputs, &lift);
         for (size_t i = 0; i < n; ++i) WritePacked(out + (done + i) * pixelStride, outputs[i]);
     }
 }

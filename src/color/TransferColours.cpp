@@ -184,19 +184,11 @@ void Avx2Colours(const TRANSFER&, const uint32_t*, std::size_t, uint32_t*, const
 }  // namespace
 
 void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
-                     uint32_t* outputs) {
+                     uint32_t* outputs, const LightnessLift* lift) {
     if (kernel == VectorKernel::Avx2)
-        Avx2Colours(transfer, colours, count, outputs, nullptr);
+        Avx2Colours(transfer, colours, count, outputs, lift);
     else
-        ScalarColours(transfer, colours, count, outputs, nullptr);
-}
-
-void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
-                     uint32_t* outputs, const LightnessLift& lift) {
-    if (kernel == VectorKernel::Avx2)
-        Avx2Colours(transfer, colours, count, outputs, &lift);
-    else
-        ScalarColours(transfer, colours, count, outputs, &lift);
+        ScalarColours(transfer, colours, count, outputs, lift);
 }
 
 }  // namespace vora

@@ -34,24 +34,20 @@ inline uint32_t TransferColour(const LabByTables& toLab, const TRANSFER& transfe
     return PackRgb(rgb.red, rgb.green, rgb.blue);
 }
 
-// outputs[i] = TransferColour(colours[i]) for i < count, bit for bit, in
-// stages over short runs of colours (the chain of one colour is a long
-// latency chain; independent colours side by side keep the core busy). The
-// Avx2 kernel runs the lightness, chroma and Lab-to-RGB stages eight colours
-// at a time, each operation the scalar one on eight lanes; it must be
-// Available.
-void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
-                     uint32_t* outputs);
-
 // Rewrites lightness[0, count) of colours [first, first + count) of a call,
 // given their lightness after the tone curve and their mapped chroma a, b.
 using LightnessLift =
     std::function<void(std::size_t first, std::size_t count, float* lightness, const float* a, const float* b)>;
 
-// The same with `lift` applied between the transfer and the conversion back
-// to RGB, where the plain kernel lifts faces: pixels inside face boxes take
-// this form, their colours and positions side by side.
+// outputs[i] = TransferColour(colours[i]) for i < count, bit for bit, in
+// stages over short runs of colours (the chain of one colour is a long
+// latency chain; independent colours side by side keep the core busy). The
+// Avx2 kernel runs the lightness, chroma and Lab-to-RGB stages eight colours
+// at a time, each operation the scalar one on eight lanes; it must be
+// Available. A `lift` runs between the transfer and the conversion back to
+// RGB, where the plain kernel lifts faces: pixels inside face boxes take this
+// form, their colours and positions side by side.
 void TransferColours(VectorKernel kernel, const TRANSFER& transfer, const uint32_t* colours, std::size_t count,
-                     uint32_t* outputs, const LightnessLift& lift);
+                     uint32_t* outputs, const LightnessLift* lift = nullptr);
 
 }  // namespace vora
