@@ -23,14 +23,6 @@
 #include "support/ModelFixtures.h"
 #include "support/TestImages.h"
 
-#if defined(__SANITIZE_THREAD__)
-#define VORA_UNDER_TSAN 1
-#elif defined(__has_feature)
-#if __has_feature(thread_sanitizer)
-#define VORA_UNDER_TSAN 1
-#endif
-#endif
-
 namespace vora {
 namespace {
 
@@ -38,7 +30,7 @@ using testimages::ImageHandle;
 using testimages::SameRecord;
 
 TEST(SharedFacade, FourThreadsGiveTheSerialResults) {
-#ifdef VORA_UNDER_TSAN
+#ifdef VORA_THREAD_SANITIZER
     tbb::global_control oneThread(tbb::global_control::max_allowed_parallelism, 1);
     cv::setNumThreads(0);
 #endif

@@ -2,7 +2,6 @@
 
 #include <array>
 #include <cmath>
-#include <cstdint>
 
 #include "color/ApplyTransfer.h"
 #include "color/ColorConversion.h"

@@ -3,7 +3,6 @@
 #include <cmath>
 #include <limits>
 #include <random>
-#include <string>
 #include <vector>
 
 #include "color/TransferColours.h"

@@ -6,7 +6,6 @@
 #include <algorithm>
 #include <cstddef>
 #include <cstdint>
-#include <string>
 
 #include "FuzzFiles.h"
 #include "model/Engine.h"

@@ -34,11 +34,8 @@ TEST_F(CliTest, FfmpegWithTheCubeReproducesApplyOnARealPhoto) {
     ASSERT_TRUE(WriteTransfers("real.png"));
     ASSERT_EQ(Run({"apply", "real.png", "t.json", "vora.png"}).status, 0);
     ASSERT_EQ(Run({"export-cube", "t.json", "look.cube", "--size", "65"}).status, 0);
-    ASSERT_EQ(std::system(("cd '" + m_work +
-                           "' && ffmpeg -loglevel error -i real.png -vf lut3d=look.cube:interp=tetrahedral "
-                           "-pix_fmt rgb24 ffmpeg.png")
-                              .c_str()),
-              0);
+    const std::string ffmpeg = " && ffmpeg -loglevel error -i real.png -vf lut3d=look.cube:interp=tetrahedral";
+    ASSERT_EQ(std::system(("cd '" + m_work + "'" + ffmpeg + " -pix_fmt rgb24 ffmpeg.png").c_str()), 0);
 
     const cv::Mat ours = ReadRgb(m_work + "/vora.png"), theirs = ReadRgb(m_work + "/ffmpeg.png");
     ASSERT_EQ(ours.size(), theirs.size());
@@ -59,10 +56,8 @@ TEST_F(CliTest, CubeHoldsTheToolsOwnColoursAtItsLatticePoints) {
     for (const auto& [size, strength] : std::vector<std::pair<int, std::string>>{{2, "1"}, {17, "1"}, {9, "0.35"}}) {
         SCOPED_TRACE(size);
         const std::string name = "lut" + std::to_string(size) + ".cube";
-        ASSERT_EQ(Run({"export-cube", "s/transfers.json:1", name, "--size", std::to_string(size), "--strength",
-                       strength})
-                      .status,
-                  0);
+        const std::string points = std::to_string(size);
+        ASSERT_EQ(Run({"export-cube", "s/transfers.json:1", name, "--size", points, "--strength", strength}).status, 0);
         int declared = 0;
         std::vector<cv::Vec3d> domain, values;
         std::istringstream in(ReadBytes(m_work + "/" + name));

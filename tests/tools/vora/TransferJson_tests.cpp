@@ -23,11 +23,7 @@ using vora::testimages::SameRecord;
 using namespace vora::clitest;
 
 TEST(TransferJson, RoundTripIsBitExactForEveryKindOfFloat) {
-    auto fromBits = [](uint32_t bits) {
-        float f;
-        std::memcpy(&f, &bits, 4);
-        return f;
-    };
+    auto fromBits = [](uint32_t bits) { float f; std::memcpy(&f, &bits, 4); return f; };
     // Specials first: NaNs with sign and payload, infinities, signed zeros,
     // the smallest subnormal, the largest float, a value with no short decimal;
     // then random bit patterns.
