@@ -54,20 +54,5 @@ TEST(ColorConversion, EveryChromaKernelEqualsTheReferenceForEveryColour) {
     }
 }
 
-// The widest kernel the build and processor allow is the one in use; a build
-// with VORA_FORCE_SCALAR has none but the scalar one.
-TEST(ColorConversion, WidestAvailableChromaKernelIsUsed) {
-#ifdef VORA_FORCE_SCALAR
-    EXPECT_FALSE(LabByTables::Available(VectorKernel::Avx2));
-    EXPECT_EQ(LabByTables::InUse(), VectorKernel::Scalar);
-#else
-#if defined(__x86_64__)
-    EXPECT_EQ(LabByTables::Available(VectorKernel::Avx2), static_cast<bool>(__builtin_cpu_supports("avx2")));
-#endif
-    EXPECT_EQ(LabByTables::InUse(),
-              LabByTables::Available(VectorKernel::Avx2) ? VectorKernel::Avx2 : VectorKernel::Scalar);
-#endif
-}
-
 }  // namespace
 }  // namespace vora

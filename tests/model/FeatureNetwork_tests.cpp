@@ -41,19 +41,6 @@ struct TempNetwork {
     }
 };
 
-TEST(FeatureNetwork, OnlyAFirstLayerOfTypeMemoryDataIsReplaced) {
-    // Commented out, inside a string, or in second place: none of these counts.
-    const PreparedDefinition plain = PrepareDefinition(R"(
-# layer { name: "old" type: "MemoryData" top: "data" memory_data_param { channels: 3 height: 4 width: 4 } }
-input: "data"
-input_shape { dim: 1 dim: 3 dim: 4 dim: 4 }
-layer { name: "type: \"MemoryData\"" type: "Pooling" bottom: "data" top: "out" }
-layer { name: "late" type: "MemoryData" top: "other" memory_data_param { channels: 3 height: 4 width: 4 } }
-layer { name: "sink" type: "Eltwise" bottom: "out" bottom: "other" top: "sum" })");
-    EXPECT_FALSE(plain.memoryData);
-    EXPECT_EQ(prototext::Parse(plain.text).All("layer").size(), 3u);
-}
-
 TEST(FeatureNetwork, RefusesDefinitionsItCannotHonour) {
     const std::string layer = R"(layer { type: "MemoryData" top: "d" memory_data_param { channels: 3 )";
     for (const std::string& text : {

@@ -44,13 +44,5 @@ TEST(NetworkInput, ReorderingAfterTheResizeGivesTheSameInput) {
     }
 }
 
-TEST(NetworkInput, EmptyImageIsReportedOnStandardError) {
-    cv::Mat input(3, 3, CV_8UC3, cv::Scalar::all(7));
-    testing::internal::CaptureStderr();
-    EXPECT_FALSE(PrepareNetworkImage(cv::Mat(), input, kNetworkImageSize, kNetworkInputSize));
-    EXPECT_EQ(testing::internal::GetCapturedStderr(), "Could not open or find the image\n");
-    EXPECT_EQ(input.rows, 3);  // the output is left as it was
-}
-
 }  // namespace
 }  // namespace vora

@@ -4,16 +4,6 @@
 
 using namespace vora::modelkit;
 
-TEST(Photos, PhotographRuleSkipsSmallAndTransparentImages) {
-    cv::Mat opaque(500, 500, CV_8UC4, cv::Scalar(1, 2, 3, 255));
-    EXPECT_TRUE(LooksLikePhotograph(opaque));
-    opaque.at<cv::Vec4b>(499, 499)[3] = 254;  // one cut-out pixel
-    EXPECT_FALSE(LooksLikePhotograph(opaque));
-    EXPECT_TRUE(LooksLikePhotograph(cv::Mat(400, 600, CV_8UC3, cv::Scalar::all(9))));
-    for (int type : {CV_8UC1, CV_16UC3}) EXPECT_FALSE(LooksLikePhotograph(cv::Mat(500, 500, type, cv::Scalar::all(9))));
-    EXPECT_FALSE(LooksLikePhotograph(cv::Mat(399, 600, CV_8UC3, cv::Scalar::all(9))));
-}
-
 TEST(Photos, AlterationsChangeWhatTheySay) {
     cv::Mat photo(101, 250, CV_8UC3);
     cv::randu(photo, 0, 256);
