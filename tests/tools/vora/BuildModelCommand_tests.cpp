@@ -11,7 +11,6 @@
 namespace {
 
 namespace fs = std::filesystem;
-using vora::testimages::SyntheticPhotoRgb;
 using namespace vora::clitest;
 
 TEST_F(CliTest, BuildModelIsDeterministicAndItsModelWorks) {

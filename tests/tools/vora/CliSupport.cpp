@@ -61,7 +61,7 @@ bool SameBytes(const cv::Mat& a, const cv::Mat& b) {
 
 cv::Mat ApplyDirect(const vora_api& api, const cv::Mat& pixels, const TRANSFER& t) {
     cv::Mat out = pixels.clone();
-    testimages::ImageHandle image(out);
+    ImageHandle image(out);
     EXPECT_EQ(api.apply_transfer(image.get(), t, image.get()), STATUS_OK);
     return out;
 }

@@ -24,6 +24,9 @@ struct RunResult {
 };
 
 using fixtures::ReadBytes;
+using testimages::ImageHandle;
+using testimages::SameRecord;
+using testimages::SyntheticPhotoRgb;
 
 // Runs the tool in folder cwd without $VORA_MODEL; its output is captured
 // outside that folder so that the folder holds only what the tool wrote.
@@ -68,7 +71,7 @@ protected:
 
     fixtures::TempFolder m_workFolder;
     std::string m_work = m_workFolder.path();
-    cv::Mat m_photo = testimages::SyntheticPhotoRgb(120, 160);
+    cv::Mat m_photo = SyntheticPhotoRgb(120, 160);
     fixtures::ModelFixture m_model{fixtures::RandomDatabase(4, 12, 7)};
     const std::string m_modelDir = m_model.modelDir();
     const vora_api m_api{m_modelDir};

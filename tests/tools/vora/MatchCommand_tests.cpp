@@ -9,9 +9,6 @@
 
 namespace {
 
-using vora::testimages::ImageHandle;
-using vora::testimages::SameRecord;
-using vora::testimages::SyntheticPhotoRgb;
 using namespace vora::clitest;
 
 TEST_F(CliTest, MatchGivesTheLibrarysTransfer) {

@@ -19,7 +19,6 @@
 
 namespace {
 
-using vora::testimages::SameRecord;
 using namespace vora::clitest;
 
 TEST(TransferJson, RoundTripIsBitExactForEveryKindOfFloat) {
