@@ -41,11 +41,11 @@ inline float FullImagePosition(size_t tileOrigin, size_t index, size_t fullExten
 // Lifts the lightness of a pixel inside face boxes. Every face starts from the
 // same base and overlapping faces combine by maximum, so face order does not
 // matter. Box edges are outside (strict comparisons, in double).
-inline float LiftFaces(const FaceBox* boxes, const FaceCorrection* faces, size_t faceCount, float px, float py,
+inline float LiftFaces(const CorrectionBox* boxes, const FaceCorrection* faces, size_t faceCount, float px, float py,
                        float base, float a, float b) {
     float lifted = base;
     for (size_t i = 0; i < faceCount; ++i) {
-        const FaceBox& box = boxes[i];
+        const CorrectionBox& box = boxes[i];
         if (px > box.xLow && px < box.xHigh && py > box.yLow && py < box.yHigh) {
             const FaceCorrection& face = faces[i];
             const float dx = (px - face.centreX) / face.halfSizeX;
@@ -86,7 +86,7 @@ void RunBand(const ApplyTransferWorker& worker, size_t rowBegin, size_t rowEnd, 
                 MapChroma(transfer.contentMean, transfer.chromaMatrix, transfer.styleMean, lab.a, lab.b);
             if constexpr (kWithFaces) {
                 const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
-                lightness = LiftFaces(worker.faceBoxes, faces, faceCount, px, py, lightness, chroma.a, chroma.b);
+                lightness = LiftFaces(worker.correctionBoxes, faces, faceCount, px, py, lightness, chroma.a, chroma.b);
             }
             const Rgb8 rgb = LabToRgb(lightness, chroma.a, chroma.b);
             out[0] = rgb.red;
@@ -224,7 +224,7 @@ void RunBatch(ColourCache& cache, VectorKernel kernel, const TRANSFER& transfer,
 // evaluated as TransferColours does with each pixel's face lift between the
 // transfer and the conversion back to RGB. Each batch's colours are read
 // before any pixel is written, so in place is safe.
-void RunLiftedBatch(const ApplyTransferWorker& worker, const std::vector<FaceBox>& boxes,
+void RunLiftedBatch(const ApplyTransferWorker& worker, const std::vector<CorrectionBox>& boxes,
                     const std::vector<FaceCorrection>& faces, float py, VectorKernel kernel, const uint8_t* in,
                     uint8_t* out, size_t column, size_t count) {
     uint32_t colours[kBatch], outputs[kBatch];
@@ -254,10 +254,10 @@ void RunLiftedBatch(const ApplyTransferWorker& worker, const std::vector<FaceBox
 void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t rowBegin, size_t rowEnd,
                    size_t columnBegin, size_t columnEnd) {
     const TRANSFER& transfer = worker.transfer;
-    const size_t faceCount = worker.faceBoxes ? std::min(worker.faceCount, transfer.faceCorrections.size()) : 0;
+    const size_t faceCount = worker.correctionBoxes ? std::min(worker.faceCount, transfer.faceCorrections.size()) : 0;
     const size_t pixelStride = worker.pixelStride;
     const VectorKernel kernel = LabByTables::InUse();
-    std::vector<FaceBox> rowBoxes;
+    std::vector<CorrectionBox> rowBoxes;
     std::vector<FaceCorrection> rowFaces;
     rowBoxes.reserve(faceCount);
     rowFaces.reserve(faceCount);
@@ -267,7 +267,7 @@ void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t
         rowFaces.clear();
         const float py = faceCount > 0 ? FullImagePosition(worker.tileTop, r, worker.fullHeight) : 0.0f;
         for (size_t i = 0; i < faceCount; ++i) {
-            const FaceBox& box = worker.faceBoxes[i];
+            const CorrectionBox& box = worker.correctionBoxes[i];
             if (py > box.yLow && py < box.yHigh) {
                 rowBoxes.push_back(box);
                 rowFaces.push_back(transfer.faceCorrections[i]);
@@ -284,7 +284,7 @@ void RunBandCached(const ApplyTransferWorker& worker, ColourCache& cache, size_t
         // take the chain with the faces' lift, also in batches.
         const auto inside = [&](size_t c) {
             const float px = FullImagePosition(worker.tileLeft, c, worker.fullWidth);
-            for (const FaceBox& box : rowBoxes)
+            for (const CorrectionBox& box : rowBoxes)
                 if (px > box.xLow && px < box.xHigh) return true;
             return false;
         };
@@ -318,7 +318,7 @@ void Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, 
 
     const CTopLeftCoordinate topLeft = source->GetTopLeft();
     const CFullResImageSize fullResSize = source->GetFullResSize();
-    const std::vector<FaceBox> faceBoxes = MakeFaceBoxes(transfer);
+    const std::vector<CorrectionBox> correctionBoxes = MakeCorrectionBoxes(transfer);
 
     // Only the tile at the origin reports, so a tiled image prints the line once.
     const int faceCount = static_cast<int>(transfer.faceCorrections.size());
@@ -329,7 +329,7 @@ void Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, 
     ApplyTransferWorker worker{rows, columns, source->GetRowStride(), source->GetPixelStride(),
                                source->GetConstData(), transfer, destination->GetData(),
                                topLeft.left, topLeft.top, fullResSize.width, fullResSize.height,
-                               faceBoxes.size(), faceBoxes.data(), nullptr};
+                               correctionBoxes.size(), correctionBoxes.data(), nullptr};
 
     // The cache is sized by the work of this call and lives only as long as it.
     const unsigned cacheBits = kernel == ApplyKernel::Plain ? 0 : ColourCacheBits(rows * columns);
@@ -349,8 +349,8 @@ void Apply(const IImage* source, const TRANSFER& transfer, IImage* destination, 
 
 }  // namespace
 
-std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer) {
-    std::vector<FaceBox> boxes;
+std::vector<CorrectionBox> MakeCorrectionBoxes(const TRANSFER& transfer) {
+    std::vector<CorrectionBox> boxes;
     boxes.reserve(transfer.faceCorrections.size());
     for (const FaceCorrection& face : transfer.faceCorrections) {
         // Each bound is computed in float and only then widened.
@@ -358,7 +358,7 @@ std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer) {
         const float xHigh = face.centreX + face.halfSizeX * 2.5f;
         const float yLow = face.centreY - face.halfSizeY * 2.5f;
         const float yHigh = face.centreY + face.halfSizeY * 2.5f;
-        boxes.push_back(FaceBox{xLow, xHigh, yLow, yHigh});
+        boxes.push_back(CorrectionBox{xLow, xHigh, yLow, yHigh});
     }
     return boxes;
 }
@@ -369,7 +369,7 @@ void ApplyTransferWorker::Run(size_t rowBegin, size_t rowEnd, size_t columnBegin
         return;
     }
     // A worker never reads past the face entries of its own record.
-    if (std::min(faceCount, transfer.faceCorrections.size()) > 0 && faceBoxes != nullptr) {
+    if (std::min(faceCount, transfer.faceCorrections.size()) > 0 && correctionBoxes != nullptr) {
         RunBand<true>(*this, rowBegin, rowEnd, columnBegin, columnEnd);
     } else {
         RunBand<false>(*this, rowBegin, rowEnd, columnBegin, columnEnd);

@@ -9,8 +9,9 @@
 
 namespace vora {
 
-// A face lift region in normalised full-image coordinates.
-struct FaceBox {
+// The region a face correction lifts, in normalised full-image coordinates
+// (not a detected face: see MakeCorrectionBoxes).
+struct CorrectionBox {
     double xLow;
     double xHigh;
     double yLow;
@@ -61,7 +62,7 @@ unsigned ColourCacheBits(size_t pixels);
 enum class ApplyKernel { Fastest, Plain };
 
 // Builds one box per face correction (centre +- 2.5 half-sizes, in float, then widened).
-std::vector<FaceBox> MakeFaceBoxes(const TRANSFER& transfer);
+std::vector<CorrectionBox> MakeCorrectionBoxes(const TRANSFER& transfer);
 
 // Body of the parallel loop: everything a band of rows needs, copied per task.
 // Both buffers are addressed with the source's strides.
@@ -78,7 +79,7 @@ struct ApplyTransferWorker {
     size_t fullWidth;
     size_t fullHeight;
     size_t faceCount;
-    const FaceBox* faceBoxes;
+    const CorrectionBox* correctionBoxes;
     // Per-thread colour caches; null runs the plain kernel.
     tbb::enumerable_thread_specific<ColourCache>* caches;
 

@@ -59,7 +59,7 @@ cv::Mat Applied(const cv::Mat& source, const TRANSFER& transfer, ApplyKernel ker
 int DifferentBytes(const cv::Mat& a, const cv::Mat& b) { return cv::countNonZero(cv::Mat(a != b).reshape(1)); }
 
 // A face whose box is exactly [3/16, 13/16] both ways: rows and columns 3 and 13 lie on its edge.
-TEST(ApplyTransfer, FaceBoxEdgeIsOutside) {
+TEST(ApplyTransfer, CorrectionBoxEdgeIsOutside) {
     const cv::Mat grey(16, 16, CV_8UC3, cv::Scalar::all(70));
     TRANSFER lifted = Identity();
     lifted.faceCorrections.push_back(FaceCorrection{0.5f, 0.5f, 0.125f, 0.125f, 0.3f, 0.0f, 0.0f, 0.5f});

@@ -31,9 +31,9 @@ double SkinColour::HueDegrees() const {
     return degrees < 0 ? degrees + 360.0 : degrees;
 }
 
-bool ParseFaceRect(const std::string& text, FaceRect& box) {
+bool ParseFaceRect(const std::string& text, CFaceRect& box) {
     char tail = 0;
-    FaceRect parsed;
+    CFaceRect parsed(0, 0, 0, 0);
     if (std::sscanf(text.c_str(), "%lf,%lf,%lf,%lf%c", &parsed.left, &parsed.right, &parsed.top, &parsed.bottom, &tail) != 4)
         return false;
     if (!(0 <= parsed.left && parsed.left < parsed.right && parsed.right <= 1)) return false;
@@ -42,7 +42,7 @@ bool ParseFaceRect(const std::string& text, FaceRect& box) {
     return true;
 }
 
-bool MeasureSkin(const cv::Mat& bgr, const FaceRect& box, SkinColour& colour) {
+bool MeasureSkin(const cv::Mat& bgr, const CFaceRect& box, SkinColour& colour) {
     if (bgr.empty() || bgr.type() != CV_8UC3) return false;
     // Pixels whose centres fall inside the box; at least one.
     const auto span = [](double from, double to, int size) {
@@ -69,7 +69,7 @@ bool MeasureSkin(const cv::Mat& bgr, const FaceRect& box, SkinColour& colour) {
     return true;
 }
 
-bool MeasureSkin(const std::string& path, const FaceRect& box, SkinColour& colour) {
+bool MeasureSkin(const std::string& path, const CFaceRect& box, SkinColour& colour) {
     return MeasureSkin(cv::imread(path, cv::IMREAD_COLOR), box, colour);
 }
 

@@ -8,14 +8,10 @@
 #include <string>
 
 #include <opencv2/core.hpp>
+#include <vora/vora.h>
 
 namespace vora {
 namespace modelkit {
-
-// Normalised, y downward, as `vora faces` prints it and `--faces` takes it.
-struct FaceRect {
-    double left = 0, right = 0, top = 0, bottom = 0;
-};
 
 struct SkinColour {
     double a = 0;
@@ -23,13 +19,14 @@ struct SkinColour {
     double HueDegrees() const;  // atan2(b*, a*) in [0, 360)
 };
 
-// "L,R,T,B" with 0 <= L < R <= 1 and 0 <= T < B <= 1.
-bool ParseFaceRect(const std::string& text, FaceRect& box);
+// "L,R,T,B" with 0 <= L < R <= 1 and 0 <= T < B <= 1: normalised, y downward,
+// as `vora faces` prints a box and `--faces` takes it.
+bool ParseFaceRect(const std::string& text, CFaceRect& box);
 
 // Median a* and b* (each on its own) of the box's pixels; the box covers at
 // least one pixel. Empty images give false.
-bool MeasureSkin(const cv::Mat& bgr, const FaceRect& box, SkinColour& colour);
-bool MeasureSkin(const std::string& path, const FaceRect& box, SkinColour& colour);
+bool MeasureSkin(const cv::Mat& bgr, const CFaceRect& box, SkinColour& colour);
+bool MeasureSkin(const std::string& path, const CFaceRect& box, SkinColour& colour);
 
 // The hue of `to` minus that of `from`, in (-180, 180].
 double HueTurn(const SkinColour& from, const SkinColour& to);

@@ -29,7 +29,7 @@ int main(int argc, char** argv) {
             images.push_back(arg);
         }
     }
-    FaceRect box;
+    vora::CFaceRect box(0, 0, 0, 0);
     if (!ParseFaceRect(argv[1], box)) {
         std::fprintf(stderr, "vora-skin-hue: '%s' is not a face box L,R,T,B with 0 <= L < R <= 1, 0 <= T < B <= 1\n", argv[1]);
         return 2;

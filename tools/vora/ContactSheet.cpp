@@ -37,7 +37,7 @@ cv::Mat MakeThumbnail(const cv::Mat& rgbOrRgba, int maxSide) {
 }
 
 cv::Mat ComposeContactSheet(const std::string& heading, const std::vector<SheetEntry>& entries,
-                            const std::vector<FaceBox>& faces) {
+                            const std::vector<CFaceRect>& faces) {
     const int count = static_cast<int>(entries.size());
     const int columns = count <= 3 ? std::max(1, count) : (count == 4 ? 2 : (count <= 9 ? 3 : 4));
     const int rows = (count + columns - 1) / columns;
@@ -58,7 +58,7 @@ cv::Mat ComposeContactSheet(const std::string& heading, const std::vector<SheetE
         const int tx = x0 + (cellW - e.thumbnail.cols) / 2;
         const int ty = y0 + (thumbHeight - e.thumbnail.rows) / 2;
         e.thumbnail.copyTo(sheet(cv::Rect(tx, ty, e.thumbnail.cols, e.thumbnail.rows)));
-        for (const FaceBox& f : faces) {
+        for (const CFaceRect& f : faces) {
             const cv::Point a(tx + static_cast<int>(std::lround(f.left * e.thumbnail.cols)),
                               ty + static_cast<int>(std::lround(f.top * e.thumbnail.rows)));
             const cv::Point b(tx + static_cast<int>(std::lround(f.right * e.thumbnail.cols)) - 1,

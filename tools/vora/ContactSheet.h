@@ -25,7 +25,7 @@ cv::Mat MakeThumbnail(const cv::Mat& rgbOrRgba, int maxSide);
 
 // R, G, B sheet: a heading line, then the entries in a grid.
 cv::Mat ComposeContactSheet(const std::string& heading, const std::vector<SheetEntry>& entries,
-                            const std::vector<FaceBox>& faces);
+                            const std::vector<CFaceRect>& faces);
 
 }  // namespace cli
 }  // namespace vora

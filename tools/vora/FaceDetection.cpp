@@ -30,7 +30,7 @@ constexpr int kMaxDetectionSide = 2000;
 
 // Pixel rectangle in the detection image -> normalised box, clipped to the
 // picture (detectors may report faces that reach over the border).
-bool ToBox(double left, double top, double right, double bottom, double width, double height, FaceBox& box) {
+bool ToBox(double left, double top, double right, double bottom, double width, double height, CFaceRect& box) {
     box.left = std::clamp(left / width, 0.0, 1.0);
     box.right = std::clamp(right / width, 0.0, 1.0);
     box.top = std::clamp(top / height, 0.0, 1.0);
@@ -113,7 +113,7 @@ std::vector<DetectedFace> DetectHaar(const cv::Mat& rgbFull) {
     return faces;
 }
 
-bool ParseBox(const std::string& text, FaceBox& box) {
+bool ParseBox(const std::string& text, CFaceRect& box) {
     double v[4];
     char tail = 0;
     if (std::sscanf(text.c_str(), "%lf,%lf,%lf,%lf%c", &v[0], &v[1], &v[2], &v[3], &tail) != 4) return false;
@@ -174,7 +174,7 @@ FaceRequest ParseFaceRequest(const std::vector<std::string>& values) {
     for (const std::string& value : values) {
         if (value == "auto" || value == "none")
             throw UsageError("--faces: '" + value + "' cannot be combined with other --faces values");
-        FaceBox box;
+        CFaceRect box(0, 0, 0, 0);
         if (!ParseBox(value, box))
             throw UsageError("--faces: '" + value + "' is not auto, none or L,R,T,B (four numbers)");
         const bool inside = box.left >= 0.0 && box.left < box.right && box.right <= 1.0 && box.top >= 0.0 &&
@@ -186,7 +186,7 @@ FaceRequest ParseFaceRequest(const std::vector<std::string>& values) {
     return request;
 }
 
-std::string FormatFaceBox(const FaceBox& box) {
+std::string FormatFaceRect(const CFaceRect& box) {
     char text[128];
     std::snprintf(text, sizeof text, "%.6f,%.6f,%.6f,%.6f", box.left, box.right, box.top, box.bottom);
     return text;

@@ -19,7 +19,7 @@ enum class FaceDetector {
 };
 
 struct DetectedFace {
-    FaceBox box;
+    CFaceRect box{0, 0, 0, 0};
     double score = 0.0;  // detector's own confidence (HOG: SVM margin; Haar: neighbour count)
 };
 
@@ -37,12 +37,12 @@ std::vector<DetectedFace> DetectFaces(const cv::Mat& rgb, FaceDetector detector)
 // 0 <= L < R <= 1, 0 <= T < B <= 1). No value means auto.
 struct FaceRequest {
     enum Kind { Auto, None, Given } kind = Auto;
-    std::vector<FaceBox> boxes;  // for Given
+    std::vector<CFaceRect> boxes;  // for Given
 };
 FaceRequest ParseFaceRequest(const std::vector<std::string>& values);
 
 // "L,R,T,B" with six digits, the form --faces reads.
-std::string FormatFaceBox(const FaceBox& box);
+std::string FormatFaceRect(const CFaceRect& box);
 
 }  // namespace cli
 }  // namespace vora

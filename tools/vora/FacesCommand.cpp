@@ -29,7 +29,7 @@ int Run(const std::vector<std::string>& args) {
     if (auto name = parsed.Value("--detector")) detector = ParseFaceDetector(*name);
     const Photo photo = ReadPhotoRgb(parsed.positionals()[0], MaxPixelsOption(parsed.Value("--max-pixels")));
     const std::vector<DetectedFace> faces = DetectFaces(PackedRgb(photo), detector);
-    for (const DetectedFace& face : faces) std::cout << FormatFaceBox(face.box) << "  " << face.score << "\n";
+    for (const DetectedFace& face : faces) std::cout << FormatFaceRect(face.box) << "  " << face.score << "\n";
     std::cerr << faces.size() << (faces.size() == 1 ? " face" : " faces") << " found by "
               << FaceDetectorName(detector) << "\n";
     return kExitOk;

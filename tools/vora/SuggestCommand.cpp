@@ -220,10 +220,8 @@ std::string PlaceFaces(const SuggestRequest& request, const cv::Mat& rgb, Transf
 // The library's proposals for the packed R, G, B pixels, with the faces.
 void ComputeProposals(const vora_api& api, const SuggestRequest& request, cv::Mat& rgb, TransferDocument& document) {
     VoraParameters params = request.params;
-    std::vector<CFaceRect> faceRects;
-    for (const FaceBox& f : document.faces) faceRects.emplace_back(f.left, f.right, f.top, f.bottom);
-    params.faceRects = faceRects.empty() ? nullptr : faceRects.data();
-    params.numFaceRects = static_cast<uint32_t>(faceRects.size());
+    params.faceRects = document.faces.empty() ? nullptr : document.faces.data();
+    params.numFaceRects = static_cast<uint32_t>(document.faces.size());
     ImageHandle image = WrapWholeImage(rgb);
     document.transfers.resize(params.numTransfers);
     CheckStatus(api.compute_transfers(image.get(), document.transfers, params), request.photoPath);

@@ -204,7 +204,7 @@ std::string SerializeTransfers(const TransferDocument& d) {
                        {"limitFactor", EncodeFloat(d.limitFactor)},
                        {"finishFactor", EncodeFloat(d.finishFactor)}};
     Json faces = Json::array();
-    for (const FaceBox& f : d.faces)
+    for (const CFaceRect& f : d.faces)
         faces.push_back({{"left", f.left}, {"right", f.right}, {"top", f.top}, {"bottom", f.bottom}});
     j["faces"] = {{"source", d.faceSource}, {"rects", faces}};
     Json transfers = Json::array();
@@ -268,12 +268,12 @@ TransferDocument ParseTransfers(const std::string& text, const std::string& sour
         for (size_t i = 0; i < rects.size(); ++i) {
             const std::string at = "faces.rects[" + std::to_string(i) + "]";
             if (!rects[i].is_object()) r.Fail(at, "expected an object");
-            FaceBox f;
-            f.left = r.Double(r.Field(rects[i], "left", at), at + ".left");
-            f.right = r.Double(r.Field(rects[i], "right", at), at + ".right");
-            f.top = r.Double(r.Field(rects[i], "top", at), at + ".top");
-            f.bottom = r.Double(r.Field(rects[i], "bottom", at), at + ".bottom");
-            d.faces.push_back(f);
+            // One statement a side, so that the first bad side is the one named.
+            const double left = r.Double(r.Field(rects[i], "left", at), at + ".left");
+            const double right = r.Double(r.Field(rects[i], "right", at), at + ".right");
+            const double top = r.Double(r.Field(rects[i], "top", at), at + ".top");
+            const double bottom = r.Double(r.Field(rects[i], "bottom", at), at + ".bottom");
+            d.faces.emplace_back(left, right, top, bottom);
         }
     }
     const Json& transfers = r.Field(j, "transfers", "");

@@ -20,13 +20,6 @@ constexpr const char* kTransferFormatName = "vora-transfers";
 // The most face corrections (and faces) a transfers file may hold.
 constexpr size_t kMaxFaceCorrections = 256;
 
-struct FaceBox {
-    double left = 0.0;
-    double right = 0.0;
-    double top = 0.0;
-    double bottom = 0.0;
-};
-
 struct TransferDocument {
     std::string tool = "vora " VORA_VERSION_STRING;
     std::string model;          // model directory the transfers came from, empty if none
@@ -35,7 +28,7 @@ struct TransferDocument {
     uint64_t photoHeight = 0;
     std::string style;          // style image ("vora match"), empty otherwise
     std::string faceSource = "none";  // "auto", "given" or "none"
-    std::vector<FaceBox> faces;       // normalised, as passed to the library
+    std::vector<CFaceRect> faces;     // normalised, as passed to the library
     // The parameters used; the face array of the record is not kept (faces above).
     uint64_t numTransfers = 0;
     float rankingFactor = 1.0f;

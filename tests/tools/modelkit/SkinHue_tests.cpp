@@ -7,7 +7,7 @@ using namespace vora::modelkit;
 // sRGB red is L* 53.24, a* 80.09, b* 67.20 (D65): hue 40.0 degrees.
 TEST(SkinHue, MedianOfTheBoxIgnoresAMinorityAndTheOutside) {
     cv::Mat photo(100, 200, CV_8UC3, cv::Scalar(255, 0, 0));  // blue outside the box
-    const FaceRect box{0.25, 0.75, 0.5, 1.0};                  // columns 50..149, rows 50..99
+    const vora::CFaceRect box(0.25, 0.75, 0.5, 1.0);  // columns 50..149, rows 50..99
     photo(cv::Rect(50, 50, 100, 50)).setTo(cv::Scalar(0, 0, 255));
     photo(cv::Rect(50, 50, 100, 10)).setTo(cv::Scalar(0, 255, 0));  // a fifth of the box: hair
     SkinColour red;
