@@ -8,11 +8,13 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
+#include <iterator>
 #include <stdexcept>
 
 #include <opencv2/core.hpp>
 
 #include "model/FeatureNetwork.h"
+#include "model/ModelFileNames.h"
 #include "model/StyleDatabase.h"
 #include "modelkit/Photos.h"
 #include "modelkit/SceneDescriptor.h"
@@ -56,7 +58,7 @@ public:
             throw std::runtime_error("cannot create the model folder " + outDir.string());
         m_path = outDir / (".vora-build-" + std::to_string(::getpid()));
         fs::remove_all(m_path, error);
-        fs::create_directories(m_path / "net", error);
+        fs::create_directories(m_path / kNetworkFolder, error);
         fs::create_directories(m_path / "pooled", error);
         if (error) throw std::runtime_error("cannot write in the model folder " + outDir.string());
     }
@@ -71,8 +73,8 @@ public:
 
     void Publish(const std::vector<std::string>& relativeNames) {
         std::error_code error;
-        fs::create_directories(m_outDir / "net", error);
-        if (error) throw std::runtime_error("cannot create " + (m_outDir / "net").string());
+        fs::create_directories(m_outDir / kNetworkFolder, error);
+        if (error) throw std::runtime_error("cannot create " + (m_outDir / kNetworkFolder).string());
         for (const std::string& name : relativeNames) {
             fs::rename(m_path / name, m_outDir / name, error);
             if (error) throw std::runtime_error("cannot write " + (m_outDir / name).string() + ": " + error.message());
@@ -301,7 +303,7 @@ void BuildModel(const BuildModelOptions& options) {
     // A given network is the model's own and its output the feature; the
     // scene descriptor's pooled values are mapped by a fit made below.
     const bool fixedNetwork = options.network != nullptr;
-    const fs::path pooledDir = staging.path() / (fixedNetwork ? "net" : "pooled");
+    const fs::path pooledDir = staging.path() / (fixedNetwork ? kNetworkFolder : "pooled");
     WriteNetworkFiles(fixedNetwork ? *options.network : PooledFeatureNetwork(), pooledDir.string());
     PhotoFeatures features;
     {
@@ -328,10 +330,8 @@ void BuildModel(const BuildModelOptions& options) {
 
     Report(options, 0.95, "writing the model");
     WriteDataFiles(staging.path(), centres, features.styles, styleFeatures);
-    if (!fixedNetwork) WriteNetworkFiles(DescriptorNetwork(projection), (staging.path() / "net").string());
-    const std::string net = kNetworkFolder;
-    staging.Publish({kClusterFileName, kStyleFileName, kScoresFileName, kDistanceFileName,
-                     net + kNetworkDefinitionName, net + kNetworkWeightsName});
+    if (!fixedNetwork) WriteNetworkFiles(DescriptorNetwork(projection), (staging.path() / kNetworkFolder).string());
+    staging.Publish({std::begin(kModelFileNames), std::end(kModelFileNames)});
     Report(options, 1.0, "done");
 }
 

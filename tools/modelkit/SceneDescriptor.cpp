@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cmath>
+#include <filesystem>
 #include <fstream>
 #include <sstream>
 #include <stdexcept>
@@ -327,8 +328,8 @@ std::vector<float> Project(const Projection& projection, const float* pooled) {
 }
 
 void WriteNetworkFiles(const NetworkFiles& network, const std::string& dir) {
-    const std::string definition = dir + "/" + kNetworkDefinitionName;
-    const std::string weights = dir + "/" + kNetworkWeightsName;
+    const std::string definition = (std::filesystem::path(dir) / kNetworkDefinitionName).string();
+    const std::string weights = (std::filesystem::path(dir) / kNetworkWeightsName).string();
     WriteText(definition, network.definition);
     if (!WriteWeightsFile(weights, network.name, network.weights))
         throw std::runtime_error("cannot write " + weights);
