@@ -7,8 +7,14 @@
 #include <cstdlib>
 #include <filesystem>
 
+#include <lcms2.h>
 #include <opencv2/imgcodecs.hpp>
 #include <opencv2/imgproc.hpp>
+
+#pragma GCC diagnostic push
+#pragma GCC diagnostic ignored "-Wdeprecated-declarations"
+#include <exiv2/exiv2.hpp>
+#pragma GCC diagnostic pop
 
 namespace vora {
 namespace clitest {
@@ -53,6 +59,27 @@ void CliTest::ExpectRefused(const std::vector<std::string>& args, int status, co
     EXPECT_EQ(std::count(r.err.begin(), r.err.end(), '\n'), 1) << r.err;
     EXPECT_NE(r.err.find(mentions), std::string::npos) << r.err;
     EXPECT_EQ(ListTree(m_work), before);
+}
+
+std::string EmbeddedProfile(const std::string& path) {
+    const auto image = Exiv2::ImageFactory::open(path);
+    image->readMetadata();
+    if (image->iccProfileDefined())
+        return std::string(reinterpret_cast<const char*>(image->iccProfile()->pData_), image->iccProfile()->size_);
+    const auto tag = image->exifData().findKey(Exiv2::ExifKey("Exif.Image.InterColorProfile"));
+    if (tag == image->exifData().end()) return {};
+    std::string bytes(tag->size(), '\0');
+    tag->copy(reinterpret_cast<Exiv2::byte*>(bytes.data()), Exiv2::invalidByteOrder);
+    return bytes;
+}
+
+std::string ProfileDescription(const std::string& iccBytes) {
+    cmsHPROFILE profile = cmsOpenProfileFromMem(iccBytes.data(), static_cast<cmsUInt32Number>(iccBytes.size()));
+    if (profile == nullptr) return "(unreadable)";
+    char text[256] = {0};
+    cmsGetProfileInfoASCII(profile, cmsInfoDescription, "en", "US", text, sizeof text);
+    cmsCloseProfile(profile);
+    return text;
 }
 
 bool SameBytes(const cv::Mat& a, const cv::Mat& b) {

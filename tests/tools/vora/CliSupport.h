@@ -39,6 +39,11 @@ std::set<std::string> ListTree(const std::string& root);
 void WriteRgb(const std::string& path, const cv::Mat& rgbOrGrey);
 cv::Mat ReadRgb(const std::string& path);
 
+// The ICC profile an image file carries (empty if none), and a profile's
+// description, read with exiv2 and Little CMS rather than the tool's own code.
+std::string EmbeddedProfile(const std::string& path);
+std::string ProfileDescription(const std::string& iccBytes);
+
 // Same size, type and bytes.
 bool SameBytes(const cv::Mat& a, const cv::Mat& b);
 
