@@ -358,7 +358,7 @@ private:
 // Facade
 // ===========================================================================
 
-class Engine;
+struct Engine;
 
 /// The library's one class: a loaded model and the operations on it.
 /// Exactly one pointer wide. Not copy-constructible; assignment shares the
