@@ -16,19 +16,15 @@ using namespace vora::clitest;
 
 const char* const kAdobeProfile = "/usr/share/color/icc/compatibleWithAdobeRGB1998.icc";
 
-bool HaveTool(const std::string& name) { return std::system(("command -v " + name + " >/dev/null").c_str()) == 0; }
-
 TEST_F(CliTest, TaggedPhotoRestylesAsItsSrgbConversionAndCanKeepItsProfile) {
-    if (!HaveTool("tificc") || !std::filesystem::exists(kAdobeProfile))
+    if (std::system("command -v tificc >/dev/null") != 0 || !std::filesystem::exists(kAdobeProfile))
         GTEST_SKIP() << "needs tificc (liblcms2-utils) and " << kAdobeProfile << " (icc-profiles-free)";
     ASSERT_TRUE(WriteTransfers());
     WriteRgb(m_work + "/orig.tif", m_photo);
-    const auto shell = [this](const std::string& command) {
-        return std::system(("cd '" + m_work + "' && " + command).c_str());
-    };
+    const std::string here = "cd '" + m_work + "' && ";
     // The photo in Adobe RGB, tagged; and that file's own conversion to sRGB.
-    ASSERT_EQ(shell(std::string("tificc -e -o") + kAdobeProfile + " orig.tif adobe.tif && tificc adobe.tif back.tif"),
-              0);
+    const std::string toAdobe = std::string("tificc -e -o") + kAdobeProfile + " orig.tif adobe.tif";
+    ASSERT_EQ(std::system((here + toAdobe + " && tificc adobe.tif back.tif").c_str()), 0);
 
     const RunResult tagged = Run({"apply", "adobe.tif", "t.json", "a.png", "--model", m_modelDir});
     ASSERT_EQ(tagged.status, 0) << tagged.err;
@@ -47,7 +43,7 @@ TEST_F(CliTest, TaggedPhotoRestylesAsItsSrgbConversionAndCanKeepItsProfile) {
         ASSERT_EQ(Run({"apply", "adobe.tif", "t.json", name, "--model", m_modelDir, "--keep-profile"}).status, 0);
         EXPECT_EQ(EmbeddedProfile(m_work + "/" + name), ReadBytes(kAdobeProfile));
     }
-    ASSERT_EQ(shell("tificc k.tif k-srgb.tif"), 0);
+    ASSERT_EQ(std::system((here + "tificc k.tif k-srgb.tif").c_str()), 0);
     EXPECT_LE(cv::norm(ReadRgb(m_work + "/k-srgb.tif"), ReadRgb(m_work + "/a.png"), cv::NORM_INF), 2.0);
 }
 

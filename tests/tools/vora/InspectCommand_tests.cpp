@@ -61,9 +61,8 @@ TEST_F(CliTest, InspectNamesWhatIsWrongWithEachBrokenModel) {
         if (c.truncate.first) {
             EXPECT_NE(r.out.find("network: loads (no test computation"), std::string::npos) << r.out;
         }
-        if (!c.suggestSays) {
+        if (!c.suggestSays)
             ExpectRefused({"apply", "photo.png", "t.json", "out.png", "--model", model.modelDir()}, 1, c.mentions);
-        }
     }
 
     const RunResult r = Run({"inspect", m_modelDir});
